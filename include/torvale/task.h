@@ -45,9 +45,148 @@ TORVALE_API int DownloadConfGet(DownloadConf *conf) TORVALE_NOEXCEPT;
 
 /* ---- Task creation ---------------------------------------------------------------- */
 
+#include <stddef.h>
+
 /* ---- Change trigger --------------------------------------------------------------- */
 
+/*
+ * Two System V shared-memory segments owned by the download daemon, which creates them
+ * (IPC_CREAT, mode 0666), resets their flags and removes them. Words are 32-bit
+ * integers in host byte order.
+ *  - trigger segment: word 0 is the change flag, set to 1 by NAVODownloadTrigger;
+ *  - progress segment: word 0 is the progress-wanted flag, set to 1 by
+ *    DownloadTriggerProgress, word 1 the system uptime in seconds at that call.
+ * The library attaches each at most once per process and keeps the attachment.
+ */
+#define DOWNLOAD_SHM_TRIGGER_KEY 0x01856E96
+#define DOWNLOAD_SHM_TRIGGER_SIZE 4
+#define DOWNLOAD_SHM_PROGRESS_KEY 0x01856EA1
+#define DOWNLOAD_SHM_PROGRESS_SIZE 8
+
+/*
+ * Attaches the segment `key` of at least `size` bytes, read-write; with `create`
+ * non-zero it is created (mode 0666) when missing. Returns its address, or null when
+ * the segment cannot be found, created or attached (errno says why). Logs nothing.
+ */
+TORVALE_API void *NAVODownloadShmAttach(int key, size_t size, int create) TORVALE_NOEXCEPT;
+
+/* Detaches an address from NAVODownloadShmAttach. Returns 0, or -1. */
+TORVALE_API int NAVODownloadShmDetach(void *addr) TORVALE_NOEXCEPT;
+
+/*
+ * Removes the segment `key` of at least `size` bytes. Returns 0, or -1 when it does not
+ * exist or cannot be removed.
+ */
+TORVALE_API int NAVODownloadShmRemove(int key, size_t size) TORVALE_NOEXCEPT;
+
+/*
+ * Sets the change flag to wake the daemon. Always returns 0; when the daemon's segment
+ * is missing nothing happens and nothing is logged.
+ */
+TORVALE_API int NAVODownloadTrigger(void) TORVALE_NOEXCEPT;
+
+/*
+ * Asks the daemon for progress: stamps the uptime, then sets the progress-wanted flag.
+ * Returns the flag's value before the call, or 0 when the segment cannot be attached
+ * (silently when it does not exist).
+ */
+TORVALE_API int DownloadTriggerProgress(void) TORVALE_NOEXCEPT;
+
+/*
+ * The database server's loadable-module magic block: five ints, the block's length in
+ * bytes (20), the server version (803), the maximum function arguments (100), index
+ * keys (32) and identifier length (64).
+ */
+typedef struct DownloadModuleMagic {
+    int len;
+    int version;
+    int funcmaxargs;
+    int indexmaxkeys;
+    int namedatalen;
+} DownloadModuleMagic;
+
+/* The constant magic block; never null, never to be released. */
+TORVALE_API const DownloadModuleMagic *Pg_magic_func(void) TORVALE_NOEXCEPT;
+
 /* ---- Task field writes ------------------------------------------------------------ */
+
+/*
+ * Each function runs one UPDATE of a task's row and returns the number of rows it
+ * changed: 1 for an existing task, 0 when no task has that id. -1 means failure: a
+ * negative id (except for DownloadTaskClearDURate), a null text or a failing
+ * statement. Nothing is read before it is written.
+ */
+
+TORVALE_API int DownloadTaskPidStatusSet(int task_id, int pid, int status) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskPidSet(int task_id, int pid) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskStatusSet(int task_id, int status) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskSeedElapsedSet(int task_id, int seconds) TORVALE_NOEXCEPT;
+
+/* `started_time` (seconds since the epoch) must be greater than 0. */
+TORVALE_API int DownloadTaskStartedTimeSet(int task_id, long started_time) TORVALE_NOEXCEPT;
+
+/* The text may be empty; it is stored exactly as given. */
+TORVALE_API int DownloadTaskFilenameSet(int task_id, const char *filename) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskDestinationSet(int task_id, const char *destination) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskExtraInfoSet(int task_id, const char *extra_info) TORVALE_NOEXCEPT;
+
+/*
+ * As DownloadTaskPidStatusSet, on a connection opened and closed for this one
+ * statement, leaving the process's persistent connection alone.
+ */
+TORVALE_API int DownloadTaskPidStatusSetNonPersistent(int task_id, int pid,
+                                                      int status) TORVALE_NOEXCEPT;
+
+TORVALE_API int DownloadTaskTotalSizeSet(int task_id, long long total_size) TORVALE_NOEXCEPT;
+
+/*
+ * Set, resp. clear, the bits of `flags` in the stored flags and keep the others. The
+ * change is made by the database on the stored value, so concurrent callers that touch
+ * different bits never lose one another's.
+ */
+TORVALE_API int DownloadTaskFlagsSet(int task_id, int flags) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskFlagsClear(int task_id, int flags) TORVALE_NOEXCEPT;
+
+/* Zeroes both rates. Checks no argument: a negative id changes nothing and gives 0. */
+TORVALE_API int DownloadTaskClearDURate(int task_id) TORVALE_NOEXCEPT;
+
+/*
+ * Sets the status of every listed task, in one statement. Ids are not checked; those
+ * without a row are not counted. Returns the rows changed, or -1 for a null list or a
+ * count of 0 or less.
+ */
+TORVALE_API int DownloadTaskMultiStatusSet(const int *task_ids, int count,
+                                           int status) TORVALE_NOEXCEPT;
+
+/* A task's progress figures, as the daemon reports them. */
+typedef struct DownloadProgressInfo {
+    long long current_size;
+    int current_rate;
+    int upload_rate;
+    int total_peers;
+    int connected_peers;
+    int total_pieces;
+    int downloaded_pieces;
+    int available_pieces;
+    long long total_upload;
+    long seeding_elapsed; /* seconds */
+    int seeders;
+    int leechers;
+} DownloadProgressInfo;
+
+/*
+ * Write a task's progress figures. Unless `force` is non-zero the write happens only
+ * while somebody wants progress (DownloadTriggerProgress); otherwise, and when the
+ * daemon's progress segment is missing, nothing is written and 1 is returned before
+ * any argument is checked. Written: the rows changed (1 or 0), or -1 for a negative
+ * id, a null record or a failing statement.
+ */
+TORVALE_API int DownloadTaskProgressSet(int task_id, long long current_size, int current_rate,
+                                        int total_peers, int connected_peers, int total_pieces,
+                                        int downloaded_pieces, int available_pieces,
+                                        int force) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskProgressSet2(int task_id, const DownloadProgressInfo *progress,
+                                         int force) TORVALE_NOEXCEPT;
 
 /* ---- Task field reads and totals -------------------------------------------------- */
 
