@@ -47,6 +47,91 @@ TORVALE_API int DownloadConfGet(DownloadConf *conf) TORVALE_NOEXCEPT;
 
 #include <stddef.h>
 
+/*
+ * A file's bytes in memory. A caller may fill one to hand a file to task creation
+ * instead of a path; it keeps ownership of the record and of the bytes.
+ */
+typedef struct DLFileSet {
+    unsigned char *data; /* the bytes; may be null only when length is 0 */
+    size_t length;       /* number of bytes at data */
+} DLFileSet;
+
+/* Task flag bits set at creation (task_flags). */
+#define DOWNLOAD_TASK_FLAG_FILE_KIND 0x02 /* added from a file with a non-zero kind */
+#define DOWNLOAD_TASK_FLAG_TORRENT 0x04   /* a magnet link, or a file with kind 0 */
+#define DOWNLOAD_TASK_FLAG_FTPS 0x10      /* a link beginning "ftps://" */
+#define DOWNLOAD_TASK_FLAG_SFTP 0x20      /* a link beginning "sftp://" */
+
+/* Files read from a path may hold at most this many bytes (100 MiB). */
+#define DOWNLOAD_TASK_FILE_MAX 104857600
+
+/*
+ * Every creation function inserts one waiting task (status 1, pid -1) with the seeding
+ * ratio and interval of the system configuration, and returns 0; on any failure it
+ * returns -1 and leaves the queue as it was. None returns the new task's id and none
+ * wakes the daemon: call NAVODownloadTrigger for that. A missing system configuration
+ * makes every creation fail.
+ */
+
+/*
+ * Adds a link for `user`, to be saved in `destination`. The file name is the text after
+ * the link's last '/' (the whole link when nothing follows it). A magnet link is named
+ * after its dn parameter, else after its info hash, when a further parameter follows
+ * (else after the whole link), and gets flag 0x04; "ftps://" links get 0x10, "sftp://"
+ * links 0x20. All three texts are required and must not be empty.
+ */
+TORVALE_API int DownloadTaskAddWithDst(const char *user, const char *url,
+                                       const char *destination) TORVALE_NOEXCEPT;
+
+/*
+ * As DownloadTaskAddWithDst, to the user's default share (DownloadUserShareGet). Fails
+ * for a user without a setting or a disabled user.
+ */
+TORVALE_API int DownloadTaskAdd(const char *user, const char *url) TORVALE_NOEXCEPT;
+
+/*
+ * DownloadTaskAddWithDst when `destination` is not null (an empty one is refused
+ * there), DownloadTaskAdd when it is null.
+ */
+TORVALE_API int DownloadTaskAddURLHandler(const char *user, const char *url,
+                                          const char *destination) TORVALE_NOEXCEPT;
+
+/*
+ * Adds a file task: the bytes of `content`, or when it is null those of the file at
+ * `path` (a regular file of at most DOWNLOAD_TASK_FILE_MAX bytes; bytes handed in
+ * through `content` are not limited). The task's url and file name are the base name
+ * of `path`. Flag 0x02 when `kind` is non-zero, 0x04 when it is 0. `extra_info` may be
+ * null or empty (stored as ''). user, path and destination are required and non-empty.
+ */
+TORVALE_API int DownloadTaskAddFileEX(const char *user, const char *path, const char *destination,
+                                      const DLFileSet *content, int kind,
+                                      const char *extra_info) TORVALE_NOEXCEPT;
+
+/* DownloadTaskAddFileEX with kind 0 (a torrent file). */
+TORVALE_API int DownloadTaskAddTorrent(const char *user, const char *path, const char *destination,
+                                       const DLFileSet *content,
+                                       const char *extra_info) TORVALE_NOEXCEPT;
+
+/* DownloadTaskAddFileEX without extra information. */
+TORVALE_API int DownloadTaskAddFileWithDst(const char *user, const char *path,
+                                           const char *destination, const DLFileSet *content,
+                                           int kind) TORVALE_NOEXCEPT;
+
+/*
+ * DownloadTaskAddFileWithDst to the user's default share. Fails for a user without a
+ * setting or a disabled user. `content` may be null.
+ */
+TORVALE_API int DownloadTaskAddDLFileSet(const char *user, const char *path,
+                                         const DLFileSet *content, int kind) TORVALE_NOEXCEPT;
+
+/*
+ * DownloadTaskAddFileWithDst when `destination` is neither null nor empty, otherwise
+ * DownloadTaskAddDLFileSet (the user's default share).
+ */
+TORVALE_API int DownloadTaskAddFileHandler(const char *user, const char *path,
+                                           const char *destination, const DLFileSet *content,
+                                           int kind) TORVALE_NOEXCEPT;
+
 /* ---- Change trigger --------------------------------------------------------------- */
 
 /*
