@@ -275,6 +275,81 @@ TORVALE_API int DownloadTaskProgressSet2(int task_id, const DownloadProgressInfo
 
 /* ---- Task field reads and totals -------------------------------------------------- */
 
+#include <stddef.h> /* size_t */
+
+/* A task's seeding settings, the columns of the same names. */
+typedef struct DownloadTaskSetting {
+    int seeding_ratio;
+    int seeding_interval;
+} DownloadTaskSetting;
+
+/*
+ * Copies the task's file name into `buf` of `size` bytes, cut to size-1 bytes and
+ * terminated (a NULL name reads as ""). Returns 0, or -1 (no such task, no connection,
+ * failing statement).
+ */
+TORVALE_API int DownloadTaskFilenameGet(int task_id, char *buf, size_t size) TORVALE_NOEXCEPT;
+
+/* The task's worker pid, -1 when none. Returns -2 on failure (no such task, ...). */
+TORVALE_API int DownloadTaskPidGet(int task_id) TORVALE_NOEXCEPT;
+
+/* The task's status code (TASK_STATUS_*). Returns -1 on failure (no such task, ...). */
+TORVALE_API int DownloadTaskStatusGet(int task_id) TORVALE_NOEXCEPT;
+
+/*
+ * The task's seeding time so far. Returns 0 on failure as well (negative id, no such
+ * task, ...); only the log tells a failure from a stored 0.
+ */
+TORVALE_API int DownloadTaskSeedElapsedGet(int task_id) TORVALE_NOEXCEPT;
+
+/* The task's uploaded bytes. Returns 0 on failure as well, as DownloadTaskSeedElapsedGet. */
+TORVALE_API unsigned long long DownloadTaskTotalUploadGet(int task_id) TORVALE_NOEXCEPT;
+
+/*
+ * Copy the task's owner, resp. destination folder, into `buf` of `size` bytes, cut to
+ * size-1 bytes and terminated (NULL reads as ""). Return 0, or -1 (negative id, null
+ * buffer, size 0 or less, no such task, no connection, failing statement).
+ */
+TORVALE_API int DownloadTaskUserGet(int task_id, char *buf, int size) TORVALE_NOEXCEPT;
+TORVALE_API int DownloadTaskDestinationGet(int task_id, char *buf, int size) TORVALE_NOEXCEPT;
+
+/* The task's flag bits. Returns -1 on failure (negative id, no such task, ...). */
+TORVALE_API int DownloadTaskFlagsGet(int task_id) TORVALE_NOEXCEPT;
+
+/*
+ * Fills `setting` with the task's seeding settings. Returns 0, or -1 (negative id,
+ * null record, no such task, ...), in which case the record is left as it was.
+ */
+TORVALE_API int DownloadTaskSettingGet(int task_id, DownloadTaskSetting *setting) TORVALE_NOEXCEPT;
+
+/*
+ * The task's extra information, in two steps. With `buf` null: returns its length in
+ * characters (0 for none). With a buffer of `size` bytes: copies it, cut to size-1
+ * bytes and terminated, and returns its full length in bytes, which exceeds size-1
+ * when the copy was cut. Returns 0 on failure (negative id, a buffer with a size of 0
+ * or less, no such task, ...); only the log tells a failure from an empty text.
+ */
+TORVALE_API int DownloadTaskExtraInfoGet(int task_id, char *buf, int size) TORVALE_NOEXCEPT;
+
+/* The number of tasks of `username` (letter case ignored), or of all users when it is
+ * null. Returns -1 on failure. */
+TORVALE_API int DownloadTaskCount(const char *username) TORVALE_NOEXCEPT;
+
+/* The highest task id of `username` (letter case ignored), or of all users when it is
+ * null; 0 when there is no task. Returns -1 on failure. */
+TORVALE_API int DownloadLastTaskIDGet(const char *username) TORVALE_NOEXCEPT;
+
+/*
+ * Sums the download and upload rates of the downloading and seeding tasks (statuses
+ * TASK_STATUS_DOWNLOADING, TASK_STATUS_SEEDING and TASK_STATUS_SEED_AUX): over every
+ * user's tasks for a member of the administrators' group, over the user's own tasks
+ * (letter case ignored) for anybody else. Rates of no task are 0. Returns 0, or -1
+ * (null argument, the group check failed, no connection, failing statement), in which
+ * case the outputs are left as they were.
+ */
+TORVALE_API int DownloadTotalRateGet(const char *username, int *download_rate,
+                                     int *upload_rate) TORVALE_NOEXCEPT;
+
 /* ---- Task control ----------------------------------------------------------------- */
 
 /* ---- Next-task selection and counts ----------------------------------------------- */
