@@ -34,22 +34,17 @@ class DaemonSegments {
         if (lock_ != -1)
             close(lock_); // releases the lock
     }
-    DaemonSegments(const DaemonSegments &) = delete;
-    DaemonSegments &operator=(const DaemonSegments &) = delete;
 
     // Creates the segment as the daemon does (IPC_CREAT, mode 0666) and attaches it here.
     volatile int *create(int key, size_t size) {
         int id = shmget(key, size, IPC_CREAT | 0666);
-        EXPECT_NE(id, -1) << "shmget(" << key << ", " << size << "): " << errno;
-        return attach(id);
+        void *addr = id != -1 ? shmat(id, nullptr, 0) : reinterpret_cast<void *>(-1);
+        EXPECT_NE(addr, reinterpret_cast<void *>(-1)) << "segment " << key << ": " << errno;
+        if (addr == reinterpret_cast<void *>(-1))
+            return nullptr;
+        attached_.push_back(addr);
+        return static_cast<volatile int *>(addr);
     }
-    volatile int *create_trigger() {
-        return create(DOWNLOAD_SHM_TRIGGER_KEY, DOWNLOAD_SHM_TRIGGER_SIZE);
-    }
-    volatile int *create_progress() {
-        return create(DOWNLOAD_SHM_PROGRESS_KEY, DOWNLOAD_SHM_PROGRESS_SIZE);
-    }
-
     // Removes the segment while this guard stays attached, as a daemon that restarts.
     static void remove(int key) {
         int id = shmget(key, 0, 0);
@@ -59,13 +54,6 @@ class DaemonSegments {
     static bool exists(int key) { return shmget(key, 0, 0) != -1; }
 
   private:
-    volatile int *attach(int id) {
-        void *addr = id != -1 ? shmat(id, nullptr, 0) : reinterpret_cast<void *>(-1);
-        if (addr == reinterpret_cast<void *>(-1))
-            return nullptr;
-        attached_.push_back(addr);
-        return static_cast<volatile int *>(addr);
-    }
     static void remove_all() {
         remove(DOWNLOAD_SHM_TRIGGER_KEY);
         remove(DOWNLOAD_SHM_PROGRESS_KEY);
