@@ -1,0 +1,70 @@
+// What the platform tests share: host accounts made for one test and removed after it
+// (tests run as root), and a scratch directory that is also the relocation root.
+#pragma once
+
+#include <cstdlib>
+#include <gtest/gtest.h>
+#include <pwd.h>
+#include <string>
+#include <unistd.h>
+
+#include "tests/fixture.h"
+
+// A user without home directory or own group, named after this process and a counter;
+// `group` makes that group its primary one.
+class HostUser {
+  public:
+    explicit HostUser(const std::string &group = "") {
+        static int counter = 0;
+        name_ = "tvu" + std::to_string(getpid()) + "x" + std::to_string(++counter);
+        std::string opts = group.empty() ? "-N " : "-g " + group + " ";
+        EXPECT_EQ(run_shell("useradd -M " + opts + name_ + " >/dev/null 2>&1"), 0) << name_;
+    }
+    ~HostUser() { run_shell("userdel " + name_ + " >/dev/null 2>&1"); }
+
+    const std::string &name() const { return name_; }
+    const char *c_str() const { return name_.c_str(); }
+    const passwd &entry() const { return *getpwnam(name_.c_str()); }
+
+  private:
+    std::string name_;
+};
+
+// A group made for the test when the host lacks it, removed after only if made here.
+class HostGroup {
+  public:
+    explicit HostGroup(const std::string &name) : name_(name) {
+        created_ = run_shell("getent group " + name_ + " >/dev/null") != 0;
+        if (created_) {
+            EXPECT_EQ(run_shell("groupadd " + name_), 0);
+        }
+    }
+    ~HostGroup() {
+        if (created_)
+            run_shell("groupdel " + name_);
+    }
+    void add(const HostUser &user) {
+        EXPECT_EQ(run_shell("gpasswd -a " + user.name() + " " + name_ + " >/dev/null"), 0);
+    }
+
+  private:
+    std::string name_;
+    bool created_ = false;
+};
+
+// A directory made for the test and exported as TORVALE_ROOT, removed after it.
+class ScratchDir : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        char tmpl[] = "/tmp/torvale-scratch.XXXXXX";
+        ASSERT_NE(mkdtemp(tmpl), nullptr);
+        dir_ = tmpl;
+        setenv("TORVALE_ROOT", dir_.c_str(), 1);
+    }
+    void TearDown() override {
+        unsetenv("TORVALE_ROOT");
+        run_shell("rm -rf '" + dir_ + "'");
+    }
+
+    std::string dir_;
+};
