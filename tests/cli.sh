@@ -24,5 +24,32 @@ check "conf get --json" '{"download_order":3,"download_when":"00:00-06:00","enab
   "$("$tv" conf get --json | tr -d ' \n')"
 check "conf get table" "download_when     00:00-06:00" "$("$tv" conf get | grep download_when)"
 
+# Task creation, field writes and the trigger.
+q() { psql -qAt -U admin -d download -c "$1"; }
+q "TRUNCATE download_queue, user_setting RESTART IDENTITY" >/dev/null
+q "INSERT INTO user_setting(username, uid, share_folder) VALUES ('cli''user', 1, '/volume1/cli')" >/dev/null
+check "task add magnet" '[{"destination":"/volume1/cli","filename":"Show.S01","flags":"4","source":"magnet:?xt=urn:btih:AB&dn=Show.S01&tr=x","task_id":"1"}]' \
+  "$("$tv" task add 'magnet:?xt=urn:btih:AB&dn=Show.S01&tr=x' --user "cli'user" --json | tr -d ' \n')"
+torrent=$(mktemp)
+printf 'd4:infod4:name3:abcee' >"$torrent"
+check "task add-file torrent" "2 $(basename "$torrent") 4 /dst" \
+  "$("$tv" task add-file "$torrent" --user "cli'user" --dest /dst --extra x | awk 'NR==2 {print $1, $3, $4, $5}')"
+check "task add-file kind" 0 "$(status "$tv" task add-file "$torrent" --user "cli'user" --kind 1)"
+check "task add-file to the share" "2|/volume1/cli" "$(q "SELECT task_flags || '|' || destination FROM download_queue WHERE task_id=3")"
+rm -f "$torrent"
+check "stored bytes" "21" "$(q "SELECT length(torrent) FROM download_queue WHERE task_id=2")"
+check "task add for a user without share fails" 1 "$(status "$tv" task add http://h/f --user nobody)"
+check "task add needs a link" 2 "$(status "$tv" task add --user "cli'user")"
+check "task set status and flags" 0 "$(status "$tv" task set 1 --status 3 --flags +0x30)"
+check "task set flags clear" '{"flags":48,"task_id":1}' "$("$tv" task set 1 --flags -4 --json | tr -d ' \n')"
+check "task set stored" "3|48" "$(q "SELECT status || '|' || task_flags FROM download_queue WHERE task_id=1")"
+check "task set unknown task" 1 "$(status "$tv" task set 99 --status 3)"
+check "task set bad flags" 2 "$(status "$tv" task set 1 --flags 4)"
+check "task set started 0 fails" 1 "$(status "$tv" task set 1 --started 0)"
+check "task progress forced" 0 "$(status "$tv" task progress 1 --size 500 --peers 3 --force)"
+check "task progress stored" "500|3" "$(q "SELECT current_size || '|' || total_peers FROM download_queue WHERE task_id=1")"
+check "trigger" 0 "$(status "$tv" trigger)"
+check "trigger --progress" 0 "$(status "$tv" trigger --progress)"
+
 [ $fails -eq 0 ] && echo "CLI checks passed"
 exit $fails

@@ -1,0 +1,202 @@
+#include <cstring>
+#include <string>
+#include <vector>
+
+#include "record/taskset_read.h"
+#include "tests/fixture.h"
+#include "torvale/task.h"
+
+namespace {
+using S = std::vector<std::string>;
+}
+
+class TaskRead : public DbTest {
+  protected:
+    void SetUp() override {
+        DbTest::SetUp();
+        exec("INSERT INTO download_queue(task_id, username, pid, url, filename, status, "
+             "total_upload, seeding_ratio, seeding_interval, seeding_elapsed, task_flags, "
+             "destination, extra_info) VALUES "
+             "(1, 'Alice', -1, 'http://h/x', 'a-rather-long-name.iso', 1, 6442450944, 150, "
+             "3600, 77, 36, 'downloads/iso', 'tracker=http://t/announce'), "
+             "(2, 'bob', 3131, 'http://h/y', NULL, 2, NULL, NULL, NULL, NULL, 0, NULL, NULL)");
+    }
+};
+
+TEST_F(TaskRead, ListingReadsReturnTheFieldOrTheirOwnFailureValue) {
+    char name[8];
+    std::memset(name, '#', sizeof name);
+    EXPECT_EQ(DownloadTaskFilenameGet(1, name, sizeof name), 0);
+    EXPECT_STREQ(name, "a-rathe");
+    EXPECT_EQ(DownloadTaskFilenameGet(2, name, sizeof name), 0);
+    EXPECT_STREQ(name, "");
+    EXPECT_EQ(DownloadTaskPidGet(1), -1); // waiting: the stored "no process"
+    EXPECT_EQ(DownloadTaskPidGet(2), 3131);
+    EXPECT_EQ(DownloadTaskStatusGet(2), 2);
+    EXPECT_TRUE(logs().empty());
+
+    std::strcpy(name, "keep");
+    EXPECT_EQ(DownloadTaskFilenameGet(99, name, sizeof name), -1);
+    EXPECT_STREQ(name, "keep");
+    EXPECT_EQ(DownloadTaskPidGet(99), -2);
+    EXPECT_EQ(DownloadTaskPidGet(-1), -2);
+    EXPECT_EQ(DownloadTaskStatusGet(99), -1);
+    EXPECT_EQ(logs(), S(4, "taskget (#) Failed to get the queue infor."));
+}
+
+TEST_F(TaskRead, ColumnReaderCopiesCutTextsAndNamesTheFieldOnFailure) {
+    EXPECT_EQ(DownloadTaskSeedElapsedGet(1), 77);
+    EXPECT_EQ(DownloadTaskTotalUploadGet(1), 6442450944ULL);
+    EXPECT_EQ(DownloadTaskSeedElapsedGet(2), 0);
+    EXPECT_EQ(DownloadTaskTotalUploadGet(2), 0ULL);
+    char buf[6];
+    EXPECT_EQ(DownloadTaskUserGet(1, buf, sizeof buf), 0);
+    EXPECT_STREQ(buf, "Alice");
+    EXPECT_EQ(DownloadTaskDestinationGet(1, buf, sizeof buf), 0);
+    EXPECT_STREQ(buf, "downl");
+    EXPECT_EQ(DownloadTaskDestinationGet(2, buf, sizeof buf), 0);
+    EXPECT_STREQ(buf, "");
+    EXPECT_EQ(DownloadTaskFieldGet(1, "status", buf, 2), 0);
+    EXPECT_STREQ(buf, "1");
+    EXPECT_TRUE(logs().empty());
+
+    EXPECT_EQ(DownloadTaskUserGet(1, buf, 0), -1);
+    EXPECT_EQ(DownloadTaskDestinationGet(1, nullptr, 10), -1);
+    EXPECT_EQ(DownloadTaskSeedElapsedGet(-4), 0);
+    EXPECT_EQ(DownloadTaskFieldGet(1, nullptr, buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadTaskTotalUploadGet(42), 0ULL);
+    EXPECT_EQ(
+        logs(),
+        (S{"taskset:# Bad parameter", "taskset:# Failed to get [username] value of task [1]",
+           "taskset:# Bad parameter", "taskset:# Failed to get [destination] value of task [1]",
+           "taskset:# Bad parameter",
+           "taskset:# Failed to get [seeding_elapsed] value of task [-4]",
+           "taskset:# Bad parameter", "taskset:# No such task id [42] in database",
+           "taskset:# Failed to get [total_upload] value of task [42]"}));
+}
+
+TEST_F(TaskRead, FlagsAndSettingsReadOrLeaveTheRecordAlone) {
+    EXPECT_EQ(DownloadTaskFlagsGet(1), 36);
+    DownloadTaskSetting setting{-5, -5};
+    EXPECT_EQ(DownloadTaskSettingGet(1, &setting), 0);
+    EXPECT_EQ(setting.seeding_ratio, 150);
+    EXPECT_EQ(setting.seeding_interval, 3600);
+    EXPECT_EQ(DownloadTaskSettingGet(2, &setting), 0);
+    EXPECT_EQ(setting.seeding_ratio, 0);
+    EXPECT_EQ(setting.seeding_interval, 0);
+    EXPECT_TRUE(logs().empty());
+
+    setting = {7, 8};
+    EXPECT_EQ(DownloadTaskSettingGet(9, &setting), -1);
+    EXPECT_EQ(DownloadTaskSettingGet(-1, &setting), -1);
+    EXPECT_EQ(setting.seeding_ratio, 7);
+    EXPECT_EQ(setting.seeding_interval, 8);
+    EXPECT_EQ(DownloadTaskSettingGet(1, nullptr), -1);
+    EXPECT_EQ(DownloadTaskFlagsGet(9), -1);
+    EXPECT_EQ(DownloadTaskFlagsGet(-9), -1);
+    EXPECT_EQ(logs(), (S{"taskset (#) There is no such task id 9 in the database...why~~~",
+                         "taskset (#) Bad parameters.", "taskset (#) Bad parameters.",
+                         "taskset (#) There is no such task id 9 in the database...why~~~",
+                         "taskset (#) Bad parameters."}));
+}
+
+TEST_F(TaskRead, ExtraInfoGivesItsLengthThenTheText) {
+    int length = DownloadTaskExtraInfoGet(1, nullptr, 0);
+    EXPECT_EQ(length, 25);
+    std::vector<char> whole(static_cast<size_t>(length) + 1, '#');
+    EXPECT_EQ(DownloadTaskExtraInfoGet(1, whole.data(), length + 1), 25);
+    EXPECT_STREQ(whole.data(), "tracker=http://t/announce");
+    char cut[8];
+    EXPECT_EQ(DownloadTaskExtraInfoGet(1, cut, sizeof cut), 25);
+    EXPECT_STREQ(cut, "tracker");
+
+    // The length is in bytes, so that it sizes the buffer of the second call.
+    exec("UPDATE download_queue SET extra_info='añ日' WHERE task_id=1");
+    length = DownloadTaskExtraInfoGet(1, nullptr, 0);
+    EXPECT_EQ(length, 6);
+    whole.assign(static_cast<size_t>(length) + 1, '#');
+    EXPECT_EQ(DownloadTaskExtraInfoGet(1, whole.data(), length + 1), 6);
+    EXPECT_STREQ(whole.data(), "añ日");
+
+    // NULL reads as the empty text in both modes.
+    EXPECT_EQ(DownloadTaskExtraInfoGet(2, nullptr, 0), 0);
+    std::strcpy(cut, "old");
+    EXPECT_EQ(DownloadTaskExtraInfoGet(2, cut, sizeof cut), 0);
+    EXPECT_STREQ(cut, "");
+    EXPECT_TRUE(logs().empty());
+
+    EXPECT_EQ(DownloadTaskExtraInfoGet(1, cut, 0), 0);
+    EXPECT_EQ(DownloadTaskExtraInfoGet(-1, nullptr, 0), 0);
+    EXPECT_EQ(DownloadTaskExtraInfoGet(5, nullptr, 0), 0);
+    EXPECT_EQ(logs(), (S{"taskset (#) Bad parameters.", "taskset (#) Bad parameters.",
+                         "taskset (#) There is no such task id 5 in the database...why~~~"}));
+}
+
+TEST_F(TaskRead, FailingStatementsAreLoggedWithTheServersText) {
+    exec("ALTER TABLE download_queue RENAME COLUMN task_flags TO flags_gone");
+    exec("ALTER TABLE download_queue RENAME COLUMN destination TO destination_gone");
+    char buf[16];
+    EXPECT_EQ(DownloadTaskFlagsGet(1), -1);
+    EXPECT_EQ(DownloadTaskDestinationGet(1, buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadTaskStatusGet(1), -1);
+    exec("ALTER TABLE download_queue RENAME COLUMN flags_gone TO task_flags");
+    exec("ALTER TABLE download_queue RENAME COLUMN destination_gone TO destination");
+    ASSERT_EQ(logs().size(), 5u);
+    EXPECT_EQ(logs()[0].rfind("taskset (#) Failed to exec [SELECT task_flags FROM download_queue "
+                              "where task_id=1] (ERROR:",
+                              0),
+              0u)
+        << logs()[0];
+    EXPECT_EQ(logs()[1].rfind("taskset:# Failed to exec [SELECT destination FROM download_queue "
+                              "where task_id=1] (ERROR:",
+                              0),
+              0u)
+        << logs()[1];
+    EXPECT_EQ(logs()[2], "taskset:# Failed to get [destination] value of task [1]");
+    EXPECT_EQ(logs()[3].rfind("queue (#) Failed to exec [SELECT task_id,", 0), 0u) << logs()[3];
+    EXPECT_EQ(logs()[4], "taskget (#) Failed to open queue handler.");
+}
+
+using TaskTotals = DbTest;
+
+TEST_F(TaskTotals, CountAndLastIdOverAllOrOneUser) {
+    EXPECT_EQ(DownloadTaskCount(nullptr), 0);
+    EXPECT_EQ(DownloadLastTaskIDGet(nullptr), 0); // max over nothing is NULL
+    EXPECT_EQ(DownloadLastTaskIDGet("alice"), 0);
+    exec("INSERT INTO download_queue(task_id, username) VALUES (3, 'Alice'), (8, 'bob'), "
+         "(5, 'ALICE'), (11, 'o''brien')");
+    EXPECT_EQ(DownloadTaskCount(nullptr), 4);
+    EXPECT_EQ(DownloadTaskCount("alice"), 2);
+    EXPECT_EQ(DownloadTaskCount("O'Brien"), 1);
+    EXPECT_EQ(DownloadTaskCount(""), 0);
+    EXPECT_EQ(DownloadLastTaskIDGet(nullptr), 11);
+    EXPECT_EQ(DownloadLastTaskIDGet("aLiCe"), 5);
+    // However long the name, the statement is sent whole.
+    std::string hostile = std::string(1500, '\'') + "') OR TRUE OR lower('";
+    EXPECT_EQ(DownloadTaskCount(hostile.c_str()), 0);
+    EXPECT_EQ(DownloadLastTaskIDGet(hostile.c_str()), 0);
+    EXPECT_TRUE(logs().empty());
+    EXPECT_EQ(value("SELECT count(*) FROM download_queue"), "4");
+}
+
+TEST_F(TaskTotals, FailingStatementsAreLoggedPerForm) {
+    exec("ALTER TABLE download_queue RENAME COLUMN username TO owner");
+    EXPECT_EQ(DownloadTaskCount("x"), -1);
+    EXPECT_EQ(DownloadLastTaskIDGet("x"), -1);
+    exec("ALTER TABLE download_queue RENAME COLUMN owner TO username");
+    exec("ALTER TABLE download_queue RENAME TO download_queue_gone");
+    EXPECT_EQ(DownloadTaskCount(nullptr), -1);
+    exec("ALTER TABLE download_queue_gone RENAME TO download_queue");
+    ASSERT_EQ(logs().size(), 3u);
+    EXPECT_EQ(logs()[0].rfind("taskget (#) Failed to exec [SELECT count(*) FROM download_queue "
+                              "WHERE lower(username)=lower('x')] (ERROR:",
+                              0),
+              0u)
+        << logs()[0];
+    EXPECT_EQ(logs()[1].rfind("taskget (#) Failed to exec [SELECT max(task_id)", 0), 0u);
+    EXPECT_EQ(logs()[2].rfind("taskget (#) Failed to query database. (ERROR:  relation "
+                              "\"download_queue\" does not exist",
+                              0),
+              0u)
+        << logs()[2];
+}
