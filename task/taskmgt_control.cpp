@@ -13,6 +13,8 @@ constexpr char kLogUnit[] = "taskmgt";
 
 constexpr char kDeleteListHead[] = "DELETE FROM download_queue WHERE task_id in (";
 constexpr char kDelete[] = "DELETE FROM download_queue WHERE task_id=%d";
+constexpr char kSettingSet[] =
+    "UPDATE download_queue SET seeding_ratio=%d, seeding_interval=%d WHERE task_id=%d";
 constexpr char kClearUser[] =
     "DELETE FROM download_queue WHERE status=%d and lower(username)=lower('%s')";
 constexpr char kClearEveryone[] = "DELETE FROM download_queue WHERE status=%d";
@@ -64,6 +66,21 @@ int exec_bulk(const std::string &sql) {
     return 0;
 }
 
+// A task id list must be there and hold at least one id.
+bool ids_given(const int *task_ids, int count) noexcept {
+    if (task_ids != nullptr && count > 0)
+        return true;
+    TV_LOG("%s (%d) Bad parameters.");
+    return false;
+}
+
+bool id_given(int task_id) noexcept {
+    if (task_id >= 0)
+        return true;
+    TV_LOG("%s (%d) Bad parameters.");
+    return false;
+}
+
 std::string delete_list(const int *task_ids, int count) {
     std::string sql = kDeleteListHead;
     for (int i = 0; i < count; ++i) {
@@ -80,10 +97,8 @@ std::string delete_list(const int *task_ids, int count) {
 extern "C" {
 
 TORVALE_API int DownloadTaskMultiDelete(const int *task_ids, int count) noexcept {
-    if (task_ids == nullptr || count <= 0) {
-        TV_LOG("%s (%d) Bad parameters.");
+    if (!ids_given(task_ids, count))
         return -1;
-    }
     std::string sql;
     try {
         sql = delete_list(task_ids, count);
@@ -99,11 +114,64 @@ TORVALE_API int DownloadTaskMultiDelete(const int *task_ids, int count) noexcept
 }
 
 TORVALE_API int DownloadTaskDelete(int task_id) noexcept {
-    if (task_id < 0) {
+    if (!id_given(task_id))
+        return -1;
+    return guarded([&] { return exec_single(torvale::db::format(kDelete, task_id)); });
+}
+
+TORVALE_API int DownloadTaskPause(int task_id) noexcept {
+    if (!id_given(task_id))
+        return -1;
+    if (DownloadTaskStatusSet(task_id, TASK_STATUS_PAUSED) < 0) {
+        TV_LOG("%s (%d) Failed to run DownloadTaskPause().");
+        return -1;
+    }
+    return 0;
+}
+
+TORVALE_API int DownloadTaskMultiPause(const int *task_ids, int count) noexcept {
+    if (!ids_given(task_ids, count))
+        return -1;
+    if (DownloadTaskMultiStatusSet(task_ids, count, TASK_STATUS_PAUSED) < 0) {
+        TV_LOG("%s (%d) Failed to run DownloadTaskMulitPause().");
+        return -1;
+    }
+    return 0;
+}
+
+TORVALE_API int DownloadTaskContinue(int task_id) noexcept {
+    if (!id_given(task_id))
+        return -1;
+    if (DownloadTaskStatusSet(task_id, TASK_STATUS_WAITING) < 0) {
+        TV_LOG("%s (%d) Failed to run DownloadTaskContinue().");
+        return -1;
+    }
+    return 0;
+}
+
+TORVALE_API int DownloadTaskMultiContinue(const int *task_ids, int count) noexcept {
+    if (!ids_given(task_ids, count))
+        return -1;
+    if (DownloadTaskMultiStatusSet(task_ids, count, TASK_STATUS_WAITING) < 0) {
+        TV_LOG("%s (%d) Failed to run DownloadTaskMulitContinue().");
+        return -1;
+    }
+    return 0;
+}
+
+TORVALE_API int DownloadTaskSettingSet(int task_id, const DownloadTaskSetting *setting) noexcept {
+    if (setting == nullptr || task_id < 0) {
         TV_LOG("%s (%d) Bad parameters.");
         return -1;
     }
-    return guarded([&] { return exec_single(torvale::db::format(kDelete, task_id)); });
+    return guarded([&] {
+        std::string sql = torvale::db::format(kSettingSet, setting->seeding_ratio,
+                                              setting->seeding_interval, task_id);
+        int rc = DownloadDBExec(sql.c_str());
+        if (rc == -1)
+            TV_LOG("%s (%d) Failed to exec [%s].", sql.c_str());
+        return rc;
+    });
 }
 
 TORVALE_API int DownloadTaskClear(const char *username) noexcept {

@@ -2,6 +2,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <new>
@@ -54,6 +55,9 @@ constexpr char kAnyUser[] =
     "SELECT task_id, download_queue.username, user_setting.user_disabled FROM download_queue, "
     "user_setting WHERE lower(user_setting.username)=lower(download_queue.username) and "
     "user_disabled!='t' and status=%d and pid=-1 %s ORDER BY task_id";
+
+constexpr char kCountByStatus[] = "SELECT task_id, pid FROM download_queue WHERE %s";
+constexpr char kTwoStatuses[] = "status=%d or status=%d";
 
 constexpr char kFtpScheme[] = "ftp://";
 constexpr size_t kFtpSchemeLen = sizeof kFtpScheme - 1;
@@ -243,9 +247,98 @@ int get_next(int order, int ftp_host_limit) {
     return rc;
 }
 
+// Whether the process answers the null signal. A process of another account refuses
+// the signal but is there all the same: taking it for gone would fail a running task
+// whenever a caller without the daemon's rights counts.
+bool process_alive(int pid) noexcept {
+    return kill(pid, 0) == 0 || errno == EPERM;
+}
+
+// Whether the task's worker, missing from its row's pid, has left for a good reason; the
+// task is marked failed otherwise.
+void check_gone_worker(int task_id, int pid) {
+    TV_LOG("%s (%d) The process [%d] of downloading task(%d) is gone. The status now is:%d", pid,
+           task_id, DownloadTaskStatusGet(task_id));
+    if (DownloadTaskStatusGet(task_id) == TASK_STATUS_FINISHED) {
+        TV_LOG("%s (%d) The status is changed to finished. So it's normal.");
+        return;
+    }
+    int now = DownloadTaskPidGet(task_id);
+    if (now > 0 && process_alive(now)) {
+        TV_LOG("%s (%d) The pid is changed. It's wget->rtorrent. So that's normal.");
+        return;
+    }
+    TV_LOG("%s (%d) What happened?");
+    DownloadTaskStatusSet(task_id, TASK_STATUS_ERROR);
+}
+
+int count_running(const char *condition) {
+    // The condition goes through the condition language, and the statement is built
+    // whole: a cut condition can mean something else entirely.
+    std::string safe(2 * std::strlen(condition) + 1, '\0');
+    if (EscapeCondition(condition, safe.data(), safe.size()) == -1) {
+        TV_LOG("%s (%d) Failed to escape condition.");
+        return -1;
+    }
+    DBConn_tag *conn = DownloadDBConnect();
+    if (conn == nullptr) {
+        TV_LOG("%s (%d) Failed to connect to database");
+        return -1;
+    }
+    std::string sql = torvale::db::format(kCountByStatus, safe.c_str());
+    torvale::db::Result result;
+    if (torvale::db::execute(conn, sql.c_str(), result) == -1) {
+        TV_LOG("%s (%d) Failed to exec [%s] (%s)", sql.c_str(), NAVODBErrorGet(conn));
+        return -1;
+    }
+    int count = 0;
+    unsigned row = 0;
+    while (NAVODBFetchRow(result.get(), &row) != -1) {
+        int task_id = static_cast<int>(torvale::db::field_int(result.get(), row, "task_id"));
+        int pid = static_cast<int>(torvale::db::field_int(result.get(), row, "pid"));
+        if (pid <= 0) {
+            TV_LOG("%s (%d) The status task [%d] is downloading but pid is %d", task_id, pid);
+            DownloadTaskStatusSet(task_id, TASK_STATUS_ERROR);
+        } else if (process_alive(pid)) {
+            ++count;
+        } else {
+            check_gone_worker(task_id, pid);
+        }
+    }
+    DownloadDBClose(conn);
+    return count;
+}
+
+int count_two_statuses(int first, int second) noexcept {
+    char condition[128];
+    std::snprintf(condition, sizeof condition, kTwoStatuses, first, second);
+    return DownloadTaskCountByStatus(condition);
+}
+
 } // namespace
 
 extern "C" {
+
+TORVALE_API int DownloadTaskCountByStatus(const char *condition) noexcept {
+    if (condition == nullptr) {
+        TV_LOG("%s (%d) Bad parameters.");
+        return -1;
+    }
+    try {
+        return count_running(condition);
+    } catch (const std::bad_alloc &) {
+        TV_LOG("%s (%d) Failed to malloc");
+        return -1;
+    }
+}
+
+TORVALE_API int DownloadTaskDownloadingCount(void) noexcept {
+    return count_two_statuses(TASK_STATUS_DOWNLOADING, TASK_STATUS_DOWNLOAD_AUX);
+}
+
+TORVALE_API int DownloadTaskSeedingCount(void) noexcept {
+    return count_two_statuses(TASK_STATUS_SEEDING, TASK_STATUS_SEED_AUX);
+}
 
 TORVALE_API int DownloadTaskGetNext(int order, int ftp_host_limit) noexcept {
     try {

@@ -44,8 +44,17 @@ TEST_F(TaskControl, FailuresLogTheirStatements) {
     exec("ALTER TABLE download_queue RENAME COLUMN task_id TO id");
     exec("ALTER TABLE download_queue RENAME COLUMN status TO state");
     const int ids[] = {4, 9, 12};
-    int rc[] = {DownloadTaskMultiDelete(ids, 3), DownloadTaskDelete(5), DownloadTaskClear("a"),
-                DownloadTaskResumeAll(nullptr), DownloadTaskPauseAll("it's")};
+    const DownloadTaskSetting setting = {150, 3600};
+    int rc[] = {DownloadTaskMultiDelete(ids, 3),
+                DownloadTaskDelete(5),
+                DownloadTaskClear("a"),
+                DownloadTaskResumeAll(nullptr),
+                DownloadTaskPauseAll("it's"),
+                DownloadTaskPause(1),
+                DownloadTaskMultiPause(ids, 3),
+                DownloadTaskContinue(1),
+                DownloadTaskMultiContinue(ids, 1),
+                DownloadTaskSettingSet(7, &setting)};
     exec("ALTER TABLE download_queue RENAME COLUMN id TO task_id");
     exec("ALTER TABLE download_queue RENAME COLUMN state TO status");
     for (int r : rc)
@@ -65,6 +74,12 @@ TEST_F(TaskControl, FailuresLogTheirStatements) {
             "status>=101]",
             "taskmgt:# Failed to exec [UPDATE download_queue SET status=3  WHERE status IN (1, 2, "
             "6, 7, 8) AND lower(username)=lower('it''s')]",
+            "taskmgt (#) Failed to run DownloadTaskPause().",
+            "taskmgt (#) Failed to run DownloadTaskMulitPause().",
+            "taskmgt (#) Failed to run DownloadTaskContinue().",
+            "taskmgt (#) Failed to run DownloadTaskMulitContinue().",
+            "taskmgt (#) Failed to exec [UPDATE download_queue SET seeding_ratio=150, "
+            "seeding_interval=3600 WHERE task_id=7].",
         }));
 }
 
@@ -110,4 +125,36 @@ TEST_F(TaskControl, ClearAndDeleteAllKeepToTheirUser) {
     EXPECT_EQ(DownloadTaskDeleteAll(nullptr), 0);
     EXPECT_EQ(rows(), "");
     EXPECT_TRUE(logs().empty());
+}
+
+TEST_F(TaskControl, PauseContinueAndSeedingSettingsChangeOnlyTheirTasks) {
+    task(1, "a", TASK_STATUS_DOWNLOADING);
+    task(2, "a", TASK_STATUS_SEEDING);
+    task(3, "a", TASK_STATUS_WAITING);
+    task(4, "b", TASK_STATUS_ERROR);
+    const int ids[] = {2, 3, 99};
+    EXPECT_EQ(DownloadTaskPause(1), 0);
+    EXPECT_EQ(DownloadTaskMultiPause(ids, 2), 0);
+    EXPECT_EQ(rows(), "1:3 2:3 3:3 4:101");
+    EXPECT_EQ(DownloadTaskContinue(4), 0);
+    EXPECT_EQ(DownloadTaskMultiContinue(ids, 3), 0);
+    EXPECT_EQ(DownloadTaskPause(99), 0);
+    EXPECT_EQ(rows(), "1:3 2:1 3:1 4:1");
+
+    DownloadTaskSetting setting = {250, 7200};
+    EXPECT_EQ(DownloadTaskSettingSet(3, &setting), 1);
+    EXPECT_EQ(DownloadTaskSettingSet(99, &setting), 0);
+    EXPECT_EQ(value("SELECT string_agg(task_id || ':' || coalesce(seeding_ratio, 0) || '/' || "
+                    "coalesce(seeding_interval, 0), ' ' ORDER BY task_id) FROM download_queue"),
+              "1:0/0 2:0/0 3:250/7200 4:0/0");
+    EXPECT_TRUE(logs().empty());
+
+    EXPECT_EQ(DownloadTaskPause(-1), -1);
+    EXPECT_EQ(DownloadTaskContinue(-1), -1);
+    EXPECT_EQ(DownloadTaskMultiPause(ids, 0), -1);
+    EXPECT_EQ(DownloadTaskMultiContinue(nullptr, 2), -1);
+    EXPECT_EQ(DownloadTaskSettingSet(3, nullptr), -1);
+    EXPECT_EQ(DownloadTaskSettingSet(-1, &setting), -1);
+    EXPECT_EQ(rows(), "1:3 2:1 3:1 4:1");
+    EXPECT_EQ(logs(), std::vector<std::string>(6, "taskmgt (#) Bad parameters."));
 }

@@ -1,8 +1,12 @@
+#include <csignal>
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include "tests/fixture.h"
+#include "torvale/database.h"
 #include "torvale/task.h"
 
 namespace {
@@ -35,6 +39,48 @@ class NextTask : public DbTest {
              std::to_string(id) + ", $q$" + owner + "$q$, " + std::to_string(status) + ", " +
              std::to_string(pid) + ", '" + url + "')");
         return id;
+    }
+};
+
+// A child process that lives until the object goes.
+class Worker {
+  public:
+    Worker() : pid_(fork()) {
+        if (pid_ == 0)
+            for (;;)
+                pause();
+    }
+    ~Worker() {
+        kill(pid_, SIGKILL);
+        waitpid(pid_, nullptr, 0);
+    }
+    Worker(const Worker &) = delete;
+    Worker &operator=(const Worker &) = delete;
+    int pid() const { return pid_; }
+
+  private:
+    pid_t pid_;
+};
+
+// The pid of a process that has ended and been reaped.
+int gone_pid() {
+    pid_t pid = fork();
+    if (pid == 0)
+        _exit(0);
+    waitpid(pid, nullptr, 0);
+    return pid;
+}
+
+class RunningCount : public NextTask {
+  protected:
+    void TearDown() override {
+        exec("DROP TRIGGER IF EXISTS test_takeover ON download_queue");
+        exec("DROP FUNCTION IF EXISTS test_takeover()");
+        NextTask::TearDown();
+    }
+    std::string statuses() {
+        return value("SELECT string_agg(task_id || ':' || status, ' ' ORDER BY task_id) FROM "
+                     "download_queue");
     }
 };
 
@@ -192,4 +238,87 @@ TEST_F(NextTask, FailingSelectionGivesMinusOneAndKeepsTheCursor) {
                              "pid=-1  ORDER BY"),
               std::string::npos)
         << logs()[1];
+}
+
+TEST_F(RunningCount, CountsLiveWorkersAndFailsTasksWithoutOne) {
+    Worker live;
+    int dead = gone_pid();
+    task(1, "u", TASK_STATUS_DOWNLOADING, live.pid());
+    task(2, "u", TASK_STATUS_DOWNLOAD_AUX, -1);
+    task(3, "u", TASK_STATUS_DOWNLOADING, 0);
+    task(4, "u", TASK_STATUS_DOWNLOADING, dead);
+    task(5, "u", TASK_STATUS_SEEDING, live.pid());
+    task(6, "u", TASK_STATUS_SEED_AUX, live.pid());
+    task(7, "u", TASK_STATUS_WAITING, -1);
+
+    EXPECT_EQ(DownloadTaskDownloadingCount(), 1);
+    EXPECT_EQ(statuses(), "1:2 2:101 3:101 4:101 5:8 6:7 7:1");
+    EXPECT_EQ(logs(), (std::vector<std::string>{
+                          "taskmgt (#) The status task [2] is downloading but pid is -1",
+                          "taskmgt (#) The status task [3] is downloading but pid is 0",
+                          "taskmgt (#) The process [" + std::to_string(dead) +
+                              "] of downloading task(4) is gone. The status now is:2",
+                          "taskmgt (#) What happened?",
+                      }));
+    EXPECT_EQ(DownloadTaskSeedingCount(), 2);
+    EXPECT_EQ(DownloadTaskDownloadingCount(), 1);
+}
+
+TEST_F(RunningCount, GoneWorkerOfAFinishedOrTakenOverTaskIsNormal) {
+    Worker successor;
+    int dead = gone_pid();
+    task(1, "u", TASK_STATUS_FINISHED, dead);
+    EXPECT_EQ(DownloadTaskCountByStatus("task_id=1"), 0);
+    EXPECT_EQ(statuses(), "1:5");
+    EXPECT_EQ(logs(), (std::vector<std::string>{
+                          "taskmgt (#) The process [" + std::to_string(dead) +
+                              "] of downloading task(1) is gone. The status now is:5",
+                          "taskmgt (#) The status is changed to finished. So it's normal.",
+                      }));
+
+    // While task 2 is repaired, the daemon hands task 3 from its first worker to another.
+    clear_logs();
+    task(2, "u", TASK_STATUS_SEEDING, -1);
+    task(3, "u", TASK_STATUS_SEED_AUX, dead);
+    exec("CREATE FUNCTION test_takeover() RETURNS trigger LANGUAGE plpgsql AS $$ BEGIN "
+         "UPDATE download_queue SET pid=" +
+         std::to_string(successor.pid()) + " WHERE task_id=3; RETURN NULL; END $$");
+    exec("CREATE TRIGGER test_takeover AFTER UPDATE OF status ON download_queue FOR EACH ROW "
+         "WHEN (NEW.task_id = 2) EXECUTE FUNCTION test_takeover()");
+    EXPECT_EQ(DownloadTaskSeedingCount(), 0);
+    EXPECT_EQ(statuses(), "1:5 2:101 3:7");
+    EXPECT_EQ(logs().back(),
+              "taskmgt (#) The pid is changed. It's wget->rtorrent. So that's normal.");
+    EXPECT_EQ(DownloadTaskSeedingCount(), 1);
+}
+
+TEST_F(RunningCount, ConditionIsCheckedAndNeverCut) {
+    Worker live;
+    task(1, "u", TASK_STATUS_DOWNLOADING, live.pid(),
+         "http://example.com/a-rather-long-link-that-goes-on-and-on/file.iso");
+    // Longer than any fixed statement buffer would keep.
+    EXPECT_EQ(DownloadTaskCountByStatus("status=2 and url='http://example.com/"
+                                        "a-rather-long-link-that-goes-on-and-on/file.iso'"),
+              1);
+    EXPECT_EQ(DownloadTaskCountByStatus("status=2; DELETE FROM download_queue"), -1);
+    EXPECT_EQ(DownloadTaskCountByStatus(nullptr), -1);
+    EXPECT_EQ(statuses(), "1:2");
+    EXPECT_EQ(logs(), (std::vector<std::string>{"taskmgt (#) Failed to escape condition.",
+                                                "taskmgt (#) Bad parameters."}));
+}
+
+TEST_F(RunningCount, WorkersOfOtherAccountsCountAsAlive) {
+    if (geteuid() != 0)
+        GTEST_SKIP() << "needs root to count as another account";
+    task(1, "u", TASK_STATUS_DOWNLOADING, getpid()); // a root process
+    pid_t child = fork();
+    if (child == 0) {
+        DownloadDBConnect(); // connect first: the session outlives the change of account
+        _exit(setuid(65534) == 0 ? DownloadTaskDownloadingCount() : 99);
+    }
+    int status = 0;
+    waitpid(child, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 1);
+    EXPECT_EQ(statuses(), "1:2");
 }

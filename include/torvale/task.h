@@ -383,6 +383,14 @@ TORVALE_API int DownloadTaskContinue(int task_id) TORVALE_NOEXCEPT;
 TORVALE_API int DownloadTaskMultiContinue(const int *task_ids, int count) TORVALE_NOEXCEPT;
 
 /*
+ * Stores the task's seeding ratio and seeding time from `setting`, which must not be
+ * null. Returns the rows changed (1, or 0 when no task has that id), or -1 (negative
+ * id, null setting, failing statement).
+ */
+TORVALE_API int DownloadTaskSettingSet(int task_id,
+                                       const DownloadTaskSetting *setting) TORVALE_NOEXCEPT;
+
+/*
  * The bulk commands. `username` null means every user's tasks; otherwise only the
  * tasks of that user, whose name is compared case-insensitively. Each returns 0, or -1
  * when the statement fails.
