@@ -18,6 +18,11 @@ struct IdsArgs {
     std::vector<int> ids;
 };
 
+struct SeedingArgs {
+    int id = 0;
+    DownloadTaskSetting setting{0, 0};
+};
+
 struct ScopeArgs {
     std::optional<std::string> user;
     bool yes = false;
@@ -39,6 +44,39 @@ void remove(const IdsArgs &args) {
     if (deleted == -1)
         cli::fail("deleting the tasks failed (see syslog)");
     cli::print_record({{"deleted", deleted}});
+}
+
+// Pause or continue: `run` over the ids, which are echoed back.
+void set_status(const char *verb, int (*run)(const int *, int), const IdsArgs &args) {
+    if (run(args.ids.data(), static_cast<int>(args.ids.size())) == -1)
+        cli::fail(std::string(verb) + " failed (see syslog)");
+    // An array for scripts; people read the ids on one line.
+    Json::Value ids(Json::arrayValue);
+    std::string line;
+    for (int id : args.ids) {
+        ids.append(id);
+        line += (line.empty() ? "" : " ") + std::to_string(id);
+    }
+    cli::print_record(
+        {{"done", verb}, {"task_ids", cli::context().json ? ids : Json::Value(line)}});
+}
+
+void seeding(const SeedingArgs &args) {
+    int changed = DownloadTaskSettingSet(args.id, &args.setting);
+    if (changed == -1)
+        cli::fail("storing the seeding settings failed (see syslog)");
+    if (changed == 0)
+        cli::fail("no task has the id " + std::to_string(args.id));
+    cli::print_record({{"task_id", args.id},
+                       {"seeding_ratio", args.setting.seeding_ratio},
+                       {"seeding_interval", args.setting.seeding_interval}});
+}
+
+void add_status(CLI::App &task, const char *verb, const char *what, int (*run)(const int *, int)) {
+    auto args = std::make_shared<IdsArgs>();
+    CLI::App *cmd = task.add_subcommand(verb, what);
+    cmd->add_option("ID", args->ids, "Task ids")->required()->check(CLI::NonNegativeNumber);
+    cmd->callback([verb, run, args] { set_status(verb, run, *args); });
 }
 
 // The bulk commands: `run` with the user, or with null for everybody.
@@ -71,8 +109,17 @@ void setup() {
 
     auto ids = std::make_shared<IdsArgs>();
     cmd = task.add_subcommand("delete", "Delete tasks, whatever their status");
-    cmd->add_option("ID", ids->ids, "Task ids")->required();
+    cmd->add_option("ID", ids->ids, "Task ids")->required()->check(CLI::NonNegativeNumber);
     cmd->callback([ids] { remove(*ids); });
+    add_status(task, "pause", "Pause tasks", DownloadTaskMultiPause);
+    add_status(task, "continue", "Put tasks back in the queue", DownloadTaskMultiContinue);
+
+    auto seed = std::make_shared<SeedingArgs>();
+    cmd = task.add_subcommand("seeding", "Set a task's seeding ratio and seeding time");
+    cmd->add_option("ID", seed->id, "Task id")->required()->check(CLI::NonNegativeNumber);
+    cmd->add_option("--ratio", seed->setting.seeding_ratio, "Seeding ratio")->required();
+    cmd->add_option("--interval", seed->setting.seeding_interval, "Seeding time")->required();
+    cmd->callback([seed] { seeding(*seed); });
 
     add_bulk(task, "clear", "Delete the finished tasks", DownloadTaskClear);
     add_bulk(task, "pause-all", "Pause the waiting, downloading and seeding tasks",

@@ -51,5 +51,38 @@ check "task progress stored" "500|3" "$(q "SELECT current_size || '|' || total_p
 check "trigger" 0 "$(status "$tv" trigger)"
 check "trigger --progress" 0 "$(status "$tv" trigger --progress)"
 
+# Next-task selection and task control.
+q "TRUNCATE download_queue, user_setting RESTART IDENTITY" >/dev/null
+q "INSERT INTO user_setting(username) VALUES ('ann'), ('Bob'), ('off')" >/dev/null
+q "UPDATE user_setting SET user_disabled=true WHERE username='off'" >/dev/null
+q "INSERT INTO download_queue(username, status, pid, url) VALUES ('ann', 1, -1, 'http://h/1'),
+   ('ann', 1, -1, 'http://h/2'), ('bob', 1, -1, 'ftp://f/3'), ('off', 1, -1, 'http://h/4'),
+   ('bob', 2, 1, 'ftp://f/5')" >/dev/null
+check "task next" "task_id    1" "$("$tv" task next | head -1)"
+check "task next --rotate after ann" '{"last_user":"bob","task_id":3}' \
+  "$("$tv" task next --rotate --after ann --json | tr -d ' \n')"
+check "task next --rotate wraps" '{"last_user":"ann","task_id":1}' \
+  "$("$tv" task next --rotate --after bob --json | tr -d ' \n')"
+check "task pause" "task_ids  1 2" "$("$tv" task pause 1 2 | tail -1)"
+check "task next skips paused" "task_id    3" "$("$tv" task next | head -1)"
+check "task next --ftp-limit" "task_id    0" "$("$tv" task next --ftp-limit 1 | head -1)"
+check "task continue" '{"done":"continue","task_ids":[2]}' "$("$tv" task continue 2 --json | tr -d ' \n')"
+check "task pause negative id" 2 "$(status "$tv" task pause -1)"
+check "task seeding" 0 "$(status "$tv" task seeding 2 --ratio 150 --interval 600)"
+check "task seeding stored" "150|600" "$(q "SELECT seeding_ratio || '|' || seeding_interval FROM download_queue WHERE task_id=2")"
+check "task seeding unknown task" 1 "$(status "$tv" task seeding 99 --ratio 1 --interval 1)"
+q "UPDATE download_queue SET status=5 WHERE task_id IN (2, 3)" >/dev/null
+check "task clear --user" 0 "$(status "$tv" task clear --user ANN)"
+check "task clear kept the others" "1:3 3:5 4:1 5:2" \
+  "$(q "SELECT string_agg(task_id || ':' || status, ' ' ORDER BY task_id) FROM download_queue")"
+check "task resume-all" 0 "$(status "$tv" task resume-all)"
+check "task pause-all --user" 0 "$(status "$tv" task pause-all --user bob)"
+check "task bulk results" "1:1 3:5 4:1 5:3" \
+  "$(q "SELECT string_agg(task_id || ':' || status, ' ' ORDER BY task_id) FROM download_queue")"
+check "task delete" '{"deleted":1}' "$("$tv" task delete 4 44 --json | tr -d ' \n')"
+check "task delete-all asks for --yes" 2 "$(status "$tv" task delete-all)"
+check "task delete-all" 0 "$(status "$tv" task delete-all --yes)"
+check "task next on an empty queue" "task_id    0" "$("$tv" task next | head -1)"
+
 [ $fails -eq 0 ] && echo "CLI checks passed"
 exit $fails
