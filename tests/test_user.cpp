@@ -1,0 +1,213 @@
+#include <cstring>
+#include <string>
+
+#include "tests/test_platform_support.h"
+#include "torvale/user.h"
+
+namespace {
+
+class UserSettings : public DbTest {
+  protected:
+    // The row of `user` as "uid|share|disabled|watch|delete|folder", "<none>" without one.
+    std::string row(const std::string &user) {
+        return value("SELECT uid || '|' || share_folder || '|' || user_disabled::int || '|' || "
+                     "enable_watchffolder::int || '|' || delete_watchtorrent::int || '|' || "
+                     "watchfolder "
+                     "FROM user_setting WHERE username = '" +
+                     user + "'");
+    }
+    void insert(const std::string &user, const std::string &folder, bool watch, bool disabled) {
+        exec("INSERT INTO user_setting(username, uid, user_disabled, enable_watchffolder, "
+             "watchfolder) VALUES('" +
+             user + "', 1, " + (disabled ? "true" : "false") + ", " + (watch ? "true" : "false") +
+             ", '" + folder + "')");
+    }
+};
+
+struct Share {
+    int rc;
+    std::string text;
+};
+
+Share share_of(const std::string &user) {
+    char buf[64];
+    std::memset(buf, 'x', sizeof buf);
+    int rc = DownloadUserShareGet(user.c_str(), buf, sizeof buf);
+    return {rc, std::string(buf, strnlen(buf, sizeof buf))};
+}
+
+std::string upper(std::string s) {
+    for (char &c : s)
+        c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    return s;
+}
+
+} // namespace
+
+TEST_F(UserSettings, FirstShareSetInsertsWithThePlatformUidLaterOnesUpdate) {
+    HostUser user;
+    ASSERT_EQ(DownloadUserShareSet(user.c_str(), "video"), 0);
+    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|0|0|");
+    // Another letter case finds the same row; only the share changes.
+    exec("UPDATE user_setting SET uid = 7, user_disabled = true");
+    ASSERT_EQ(DownloadUserShareSet(upper(user.name()).c_str(), "it's \"映画\""), 0);
+    EXPECT_EQ(count("SELECT * FROM user_setting"), 1);
+    EXPECT_EQ(row(user.name()), "7|it's \"映画\"|1|0|0|");
+    EXPECT_TRUE(logs().empty());
+}
+
+TEST_F(UserSettings, ShareGetReportsEnabledDisabledAndAbsentUsers) {
+    HostUser user;
+    ASSERT_EQ(DownloadUserShareSet(user.c_str(), "downloads/it's"), 0);
+    Share got = share_of(upper(user.name()));
+    EXPECT_EQ(got.rc, 1);
+    EXPECT_EQ(got.text, "downloads/it's");
+
+    ASSERT_EQ(DownloadUserDisable(user.c_str(), 1), 0);
+    got = share_of(user.name());
+    EXPECT_EQ(got.rc, 2);
+    EXPECT_EQ(got.text, "downloads/it's");
+
+    got = share_of("nobody-here");
+    EXPECT_EQ(got.rc, 0);
+    EXPECT_EQ(got.text, "");
+
+    // Cut to the buffer and terminated.
+    char small[5];
+    EXPECT_EQ(DownloadUserShareGet(user.c_str(), small, sizeof small), 2);
+    EXPECT_STREQ(small, "down");
+    EXPECT_TRUE(logs().empty());
+}
+
+TEST_F(UserSettings, ShareCallsRefuseBadArgumentsAndUnknownUsers) {
+    char buf[8] = "keep";
+    EXPECT_EQ(DownloadUserShareGet(nullptr, buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadUserShareGet("", buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadUserShareGet("a", nullptr, 8), -1);
+    EXPECT_EQ(DownloadUserShareGet("a", buf, 0), -1);
+    EXPECT_STREQ(buf, "keep");
+    EXPECT_EQ(DownloadUserShareSet("a", ""), -1);
+    EXPECT_EQ(DownloadUserShareSet(nullptr, "video"), -1);
+    EXPECT_EQ(logs().size(), 6u);
+    EXPECT_TRUE(logged("user (#) Bad parameters."));
+    clear_logs();
+
+    EXPECT_EQ(DownloadUserShareSet("tv-no-such-user", "video"), -1);
+    EXPECT_EQ(count("SELECT * FROM user_setting"), 0);
+    EXPECT_EQ(logs(),
+              std::vector<std::string>{"user:# Failed to get user [tv-no-such-user][0x1D00]"});
+}
+
+TEST_F(UserSettings, WatchOffForANewUserInsertsAnEmptySwitchedOffRow) {
+    HostUser user;
+    ASSERT_EQ(DownloadUserWatchInfoSet(user.c_str(), 0, 1, nullptr), 0);
+    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "||0|0|1|");
+
+    int enabled = 7, del = 7;
+    char folder[32] = "x";
+    EXPECT_EQ(DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder), 1);
+    EXPECT_EQ(enabled, 0);
+    EXPECT_EQ(del, 1);
+    EXPECT_STREQ(folder, "");
+}
+
+TEST_F(UserSettings, WatchOnStoresFolderAndFlagOffKeepsThem) {
+    HostUser user;
+    ASSERT_EQ(DownloadUserShareSet(user.c_str(), "video"), 0);
+    ASSERT_EQ(DownloadUserWatchInfoSet(upper(user.name()).c_str(), 1, 1, "/volume1/it's/w"), 0);
+    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|1|1|/volume1/it's/w");
+    ASSERT_EQ(DownloadUserWatchInfoSet(user.c_str(), 0, 0, nullptr), 0);
+    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|0|1|/volume1/it's/w");
+
+    // Values left over in the caller's ints never read as set.
+    int enabled = 1, del = 1;
+    char folder[8];
+    EXPECT_EQ(DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder), 1);
+    EXPECT_EQ(enabled, 0);
+    EXPECT_EQ(del, 1);
+    EXPECT_STREQ(folder, "/volume");
+    ASSERT_EQ(DownloadUserWatchInfoSet(user.c_str(), 1, 0, "/w"), 0);
+    EXPECT_EQ(DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder), 1);
+    EXPECT_EQ(enabled, 1);
+    EXPECT_EQ(del, 0);
+    EXPECT_STREQ(folder, "/w");
+    EXPECT_TRUE(logs().empty());
+}
+
+TEST_F(UserSettings, WatchCallsRefuseBadArguments) {
+    int enabled = 5, del = 5;
+    char folder[8] = "keep";
+    EXPECT_EQ(DownloadUserWatchInfoGet("nobody-here", &enabled, &del, folder, sizeof folder), 0);
+    EXPECT_STREQ(folder, "");
+    EXPECT_EQ(enabled, 5);
+    EXPECT_TRUE(logs().empty());
+
+    EXPECT_EQ(DownloadUserWatchInfoGet("a", nullptr, &del, folder, sizeof folder), -1);
+    EXPECT_EQ(DownloadUserWatchInfoGet("a", &enabled, nullptr, folder, sizeof folder), -1);
+    EXPECT_EQ(DownloadUserWatchInfoGet("a", &enabled, &del, nullptr, 8), -1);
+    EXPECT_EQ(DownloadUserWatchInfoGet("", &enabled, &del, folder, sizeof folder), -1);
+    EXPECT_EQ(DownloadUserWatchInfoSet("a", 1, 0, ""), -1);
+    EXPECT_EQ(DownloadUserWatchInfoSet("a", 1, 0, nullptr), -1);
+    EXPECT_EQ(DownloadUserWatchInfoSet(nullptr, 0, 0, nullptr), -1);
+    EXPECT_EQ(logs(), std::vector<std::string>(7, "user (#) Bad parameters."));
+    clear_logs();
+    EXPECT_EQ(DownloadUserWatchInfoSet("tv-no-such-user", 0, 0, nullptr), -1);
+    EXPECT_EQ(logs(),
+              std::vector<std::string>{"user:# Failed to get user [tv-no-such-user][0x1D00]"});
+}
+
+TEST_F(UserSettings, WatchFolderClashesOnlyWithOtherActiveWatchers) {
+    insert("Me", "/v/mine", true, false);
+    insert("off", "/v/off", false, false);
+    insert("gone", "/v/gone", true, true);
+    insert("other", "/v/taken", true, false);
+    EXPECT_EQ(DownloadCheckWatchfolder("me", "/v/mine"), 1);
+    EXPECT_EQ(DownloadCheckWatchfolder("me", "/v/off"), 1);
+    EXPECT_EQ(DownloadCheckWatchfolder("me", "/v/gone"), 1);
+    EXPECT_EQ(DownloadCheckWatchfolder("me", "/v/taken"), 0);
+    EXPECT_EQ(DownloadCheckWatchfolder("OTHER", "/v/taken"), 1);
+    EXPECT_EQ(DownloadCheckWatchfolder("me", "/v/taken/"), 1);
+    EXPECT_EQ(DownloadCheckWatchfolder("me", "/V/TAKEN"), 1);
+    EXPECT_TRUE(logs().empty());
+    EXPECT_EQ(DownloadCheckWatchfolder("me", nullptr), -1);
+    EXPECT_EQ(DownloadCheckWatchfolder("", "/v"), -1);
+}
+
+TEST_F(UserSettings, DisableSwitchesWatchingOffAndEnableLeavesItOff) {
+    insert("Ann", "/w", true, false);
+    ASSERT_EQ(DownloadUserDisable("ANN", 1), 0);
+    EXPECT_EQ(
+        value("SELECT user_disabled::int || ' ' || enable_watchffolder::int FROM user_setting"),
+        "1 0");
+    ASSERT_EQ(DownloadUserDisable("ann", 0), 0);
+    EXPECT_EQ(
+        value("SELECT user_disabled::int || ' ' || enable_watchffolder::int FROM user_setting"),
+        "0 0");
+    // A user without a row: nothing to change, no failure.
+    EXPECT_EQ(DownloadUserDisable("nobody-here", 1), 0);
+    EXPECT_EQ(count("SELECT * FROM user_setting"), 1);
+    EXPECT_TRUE(logs().empty());
+    EXPECT_EQ(DownloadUserDisable(nullptr, 1), -1);
+}
+
+TEST_F(UserSettings, FailingStatementsAreLoggedAndLeaveTheRowAlone) {
+    HostUser user;
+    ASSERT_EQ(DownloadUserShareSet(user.c_str(), "video"), 0);
+    exec("ALTER TABLE user_setting RENAME COLUMN user_disabled TO user_off");
+    char buf[16];
+    EXPECT_EQ(DownloadUserShareGet(user.c_str(), buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadUserDisable(user.c_str(), 1), -1);
+    exec("ALTER TABLE user_setting RENAME COLUMN user_off TO user_disabled");
+    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|0|0|");
+    ASSERT_EQ(logs().size(), 3u);
+    EXPECT_EQ(logs()[0].rfind("user (#) Failed to exec [SELECT share_folder, user_disabled FROM "
+                              "user_setting WHERE lower(username)=lower('" +
+                                  user.name() + "')] (ERROR:",
+                              0),
+              0u)
+        << logs()[0];
+    EXPECT_EQ(logs()[1].rfind("database (#) Failed to exec [UPDATE user_setting SET", 0), 0u);
+    EXPECT_EQ(logs()[2], "user (#) Failed to exec [UPDATE user_setting SET user_disabled='t', "
+                         "enable_watchffolder='f' WHERE lower(username)=lower('" +
+                             user.name() + "')]");
+}

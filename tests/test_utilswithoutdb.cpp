@@ -1,0 +1,117 @@
+#include <fstream>
+#include <string>
+#include <sys/stat.h>
+
+#include "tests/fixture.h"
+#include "torvale/utils.h"
+
+namespace {
+
+class FreeName : public DbTest {
+  protected:
+    void SetUp() override {
+        DbTest::SetUp();
+        dir_ = root() + "/dl";
+        ASSERT_EQ(mkdir(dir_.c_str(), 0755), 0);
+    }
+    void touch(const std::string &name) { std::ofstream(dir_ + "/" + name) << "x"; }
+    // The free name found for `name`, relative to the directory.
+    std::string free_name(const std::string &name) {
+        char out[4096] = "untouched";
+        EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, dir_.c_str(), name.c_str()), 0);
+        std::string path = out;
+        EXPECT_EQ(path.rfind(dir_ + "/", 0), 0u) << path;
+        return path.substr(dir_.size() + 1);
+    }
+    std::string dir_;
+};
+
+} // namespace
+
+using LinkKind = DbTest;
+
+TEST_F(LinkKind, MagnetPrefixIgnoresLetterCaseButNeedsTheQuestionMark) {
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:?xt=urn:btih:abc"), 1);
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("MAGNET:?XT"), 1);
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:?"), 1);
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:xt=urn"), 0);
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:"), 0);
+    EXPECT_EQ(DownloadUtilsIsMagnetLink(" magnet:?xt"), 0);
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("http://x/?magnet:?"), 0);
+    EXPECT_TRUE(logs().empty());
+    EXPECT_EQ(DownloadUtilsIsMagnetLink(nullptr), 0);
+    EXPECT_EQ(logs(), std::vector<std::string>{"utilswithoutdb:# Bad parameter"});
+}
+
+TEST_F(LinkKind, EncryptedFtpSchemesIgnoreLetterCase) {
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftps://host/file"), 1);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("FtPs://host"), 1);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("sftp://host/file"), 2);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("SFTP://HOST"), 2);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftp://host/file"), 0);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftps:/host"), 0);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("sftp"), 0);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink(""), 0);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink(nullptr), 0);
+    EXPECT_EQ(logs(), std::vector<std::string>{"utilswithoutdb:# Bad parameter"});
+}
+
+TEST_F(FreeName, AFreeNameComesBackUnchanged) {
+    EXPECT_EQ(free_name("movie.avi"), "movie.avi");
+    EXPECT_EQ(free_name("it's \"ü\" 映画.mkv"), "it's \"ü\" 映画.mkv");
+}
+
+TEST_F(FreeName, TakenNamesAreNumberedBeforeTheLastExtension) {
+    touch("movie.avi");
+    EXPECT_EQ(free_name("movie.avi"), "movie1.avi");
+    touch("movie1.avi");
+    EXPECT_EQ(free_name("movie.avi"), "movie2.avi");
+    touch("a.tar.gz");
+    EXPECT_EQ(free_name("a.tar.gz"), "a.tar1.gz");
+    touch("README");
+    EXPECT_EQ(free_name("README"), "README1");
+    touch(".hidden");
+    EXPECT_EQ(free_name(".hidden"), "1.hidden");
+    touch("trailing.");
+    EXPECT_EQ(free_name("trailing."), "trailing1.");
+    // Anything of that name counts, directories too.
+    ASSERT_EQ(mkdir((dir_ + "/folder").c_str(), 0755), 0);
+    EXPECT_EQ(free_name("folder"), "folder1");
+    EXPECT_TRUE(logs().empty());
+}
+
+TEST_F(FreeName, MissingArgumentsLeaveTheBufferAlone) {
+    char out[64] = "untouched";
+    EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, nullptr, "a"), -1);
+    EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, dir_.c_str(), nullptr), -1);
+    EXPECT_EQ(NAVODLValidateFilename(out, 0, dir_.c_str(), "a"), -1);
+    EXPECT_EQ(NAVODLValidateFilename(nullptr, 64, dir_.c_str(), "a"), -1);
+    EXPECT_STREQ(out, "untouched");
+    EXPECT_EQ(logs().size(), 4u);
+    EXPECT_EQ(logs()[0], "utilswithoutdb:# Bad parameter");
+}
+
+TEST_F(FreeName, ACandidateThatDoesNotFitIsRefusedNotCut) {
+    // Cut to "<root>/dl" the first candidate would name the existing directory itself
+    // and every further one likewise: the search must stop at once.
+    std::string dir = dir_;
+    char out[256];
+    int size = static_cast<int>(dir.size() + 1);
+    EXPECT_EQ(NAVODLValidateFilename(out, size, dir.c_str(), "movie.avi"), -1);
+    EXPECT_STREQ(out, "");
+    // The numbered candidate is one byte longer than the plain one.
+    touch("m.avi");
+    size = static_cast<int>(dir.size() + std::string("/m.avi").size() + 1);
+    EXPECT_EQ(NAVODLValidateFilename(out, size, dir.c_str(), "m.avi"), -1);
+    EXPECT_EQ(logs().size(), 2u);
+    EXPECT_EQ(logs()[1], "utilswithoutdb:# Buffer size too small, string length [" +
+                             std::to_string(size + 1) + "], buffer size [" + std::to_string(size) +
+                             "]");
+}
+
+TEST_F(FreeName, OverlongNamesAreCutToTheWorkingBuffer) {
+    std::string name(1500, 'n');
+    char out[4096];
+    ASSERT_EQ(NAVODLValidateFilename(out, sizeof out, dir_.c_str(), name.c_str()), 0);
+    EXPECT_EQ(std::string(out), dir_ + "/" + std::string(1023, 'n'));
+}
