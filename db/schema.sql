@@ -44,6 +44,10 @@ CREATE INDEX IF NOT EXISTS download_queue_waiting_user_idx
 CREATE INDEX IF NOT EXISTS download_queue_user_idx ON download_queue (lower(username));
 -- Counts and sweeps by status (downloading, seeding, paused, errors).
 CREATE INDEX IF NOT EXISTS download_queue_status_idx ON download_queue (status);
+-- Listings of the whole queue ordered by owner read a page from here instead of
+-- sorting every task (ties by task id are sorted within each owner's group). The name
+-- is never updated, so the daemon's frequent progress writes do not touch this index.
+CREATE INDEX IF NOT EXISTS download_queue_username_idx ON download_queue (username);
 
 CREATE TABLE IF NOT EXISTS user_setting (
     username            text NOT NULL,

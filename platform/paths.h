@@ -28,5 +28,6 @@ inline constexpr char kDownloadServiceLink[] = "/var/services/download";
 inline constexpr char kProcMounts[] = "/proc/mounts";
 inline constexpr char kSharesRegistry[] = "/etc/torvale/shares";
 inline constexpr char kIndexSpool[] = "/var/spool/torvale/index";
+inline constexpr char kFileIndexSpool[] = "/var/spool/torvale/fileindex";
 
 } // namespace torvale::paths

@@ -84,5 +84,36 @@ check "task delete-all asks for --yes" 2 "$(status "$tv" task delete-all)"
 check "task delete-all" 0 "$(status "$tv" task delete-all --yes)"
 check "task next on an empty queue" "task_id    0" "$("$tv" task next | head -1)"
 
+# torvale user / util
+psql -q -U admin -d download -c "TRUNCATE user_setting" >/dev/null
+cliuser="tvcli$$"
+useradd -M -N "$cliuser" >/dev/null 2>&1
+check "user show without settings fails" 1 "$(status "$tv" user show "$cliuser")"
+check "share set for an unknown user fails" 1 "$(status "$tv" user share set "nouser$$" video)"
+check "watch set needs FOLDER or --off" 2 "$(status "$tv" user watch set "$cliuser")"
+check "watch set FOLDER --off is usage" 2 "$(status "$tv" user watch set "$cliuser" /w --off)"
+"$tv" user share set "$cliuser" video >/dev/null
+"$tv" user watch set "$(echo "$cliuser" | tr a-z A-Z)" /volume1/watch --delete-torrent >/dev/null
+check "user show --json" "{\"delete_torrent\":1,\"disabled\":0,\"share\":\"video\",\"user\":\"$cliuser\",\"watch_enabled\":1,\"watch_folder\":\"/volume1/watch\"}" \
+  "$("$tv" user show "$cliuser" --json | tr -d ' \n')"
+check "watch check taken" "free    false" "$("$tv" user watch check other /volume1/watch | grep free)"
+check "watch check own folder" "free    true" "$("$tv" user watch check "$cliuser" /volume1/watch | grep free)"
+"$tv" user disable "$cliuser" >/dev/null
+check "disable switches watching off" "watch_enabled   0" "$("$tv" user show "$cliuser" | grep watch_enabled)"
+check "disabled user" "disabled        1" "$("$tv" user show "$cliuser" | grep '^disabled')"
+"$tv" user enable "$cliuser" >/dev/null
+check "enabled user" "disabled        0" "$("$tv" user show "$cliuser" | grep '^disabled')"
+"$tv" user watch set "$cliuser" --off >/dev/null
+check "watch off keeps the folder" "watch_folder    /volume1/watch" "$("$tv" user show "$cliuser" | grep watch_folder)"
+userdel "$cliuser" >/dev/null 2>&1
+check "link-kind magnet" '{"kind":"magnet"}' "$("$tv" util link-kind 'MAGNET:?xt=1' --json | tr -d ' \n')"
+check "link-kind sftp" "kind  sftp" "$("$tv" util link-kind SFTP://host/f)"
+check "link-kind other" "kind  other" "$("$tv" util link-kind ftp://host/f)"
+freedir=$(mktemp -d)
+touch "$freedir/a.tar.gz"
+check "free-name numbers before the extension" "path  $freedir/a.tar1.gz" "$("$tv" util free-name "$freedir" a.tar.gz)"
+check "free-name of a free name" "path  $freedir/b" "$("$tv" util free-name "$freedir" b)"
+rm -rf "$freedir"
+
 [ $fails -eq 0 ] && echo "CLI checks passed"
 exit $fails

@@ -2,7 +2,7 @@
 #include <thread>
 
 #include "platform/navosdk.h"
-#include "tests/test_platform_accounts.h"
+#include "tests/test_platform_support.h"
 
 namespace {
 

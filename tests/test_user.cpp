@@ -1,7 +1,7 @@
 #include <cstring>
 #include <string>
 
-#include "tests/test_platform_accounts.h"
+#include "tests/test_platform_support.h"
 #include "torvale/user.h"
 
 namespace {

@@ -1,6 +1,8 @@
-// Host accounts made for one test and removed after it. Tests run as root.
+// What the platform tests share: host accounts made for one test and removed after it
+// (tests run as root), and a scratch directory that is also the relocation root.
 #pragma once
 
+#include <cstdlib>
 #include <gtest/gtest.h>
 #include <pwd.h>
 #include <string>
@@ -64,4 +66,21 @@ class HostGroup {
   private:
     std::string name_;
     bool created_ = false;
+};
+
+// A directory made for the test and exported as TORVALE_ROOT, removed after it.
+class ScratchDir : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        char tmpl[] = "/tmp/torvale-scratch.XXXXXX";
+        ASSERT_NE(mkdtemp(tmpl), nullptr);
+        dir_ = tmpl;
+        setenv("TORVALE_ROOT", dir_.c_str(), 1);
+    }
+    void TearDown() override {
+        unsetenv("TORVALE_ROOT");
+        run_shell("rm -rf '" + dir_ + "'");
+    }
+
+    std::string dir_;
 };
