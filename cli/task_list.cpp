@@ -244,8 +244,17 @@ void show(int task_id) {
                        {"extra_info", extra}});
 }
 
-void count(const std::optional<std::string> &user) {
-    int n = DownloadTaskCount(user ? user->c_str() : nullptr);
+struct CountArgs {
+    std::optional<std::string> user;
+    bool downloading = false, seeding = false;
+};
+
+// All tasks (of a user), or the running ones: those count only with a live worker, and
+// the count fails the tasks whose worker has gone.
+void count(const CountArgs &args) {
+    int n = args.downloading ? DownloadTaskDownloadingCount()
+            : args.seeding   ? DownloadTaskSeedingCount()
+                             : DownloadTaskCount(args.user ? args.user->c_str() : nullptr);
     if (n == -1)
         cli::fail("counting failed (see syslog)");
     cli::print_record({{"count", n}});
@@ -279,10 +288,17 @@ void setup() {
     sh->add_option("id", *id, "Task id")->required();
     sh->callback([id] { show(*id); });
 
-    auto user = std::make_shared<std::optional<std::string>>();
+    auto cargs = std::make_shared<CountArgs>();
     CLI::App *cnt = task.add_subcommand("count", "Count tasks");
-    cnt->add_option("--user", *user, "Only this user's tasks (letter case ignored)");
-    cnt->callback([user] { count(*user); });
+    CLI::Option *user =
+        cnt->add_option("--user", cargs->user, "Only this user's tasks (letter case ignored)");
+    CLI::Option *downloading = cnt->add_flag("--downloading", cargs->downloading,
+                                             "Downloading tasks whose worker is alive");
+    cnt->add_flag("--seeding", cargs->seeding, "Seeding tasks whose worker is alive")
+        ->excludes(downloading)
+        ->excludes(user);
+    downloading->excludes(user);
+    cnt->callback([cargs] { count(*cargs); });
 }
 
 cli::Registration reg(setup);

@@ -83,6 +83,12 @@ check "task delete" '{"deleted":1}' "$("$tv" task delete 4 44 --json | tr -d ' \
 check "task delete-all asks for --yes" 2 "$(status "$tv" task delete-all)"
 check "task delete-all" 0 "$(status "$tv" task delete-all --yes)"
 check "task next on an empty queue" "task_id    0" "$("$tv" task next | head -1)"
+q "INSERT INTO download_queue(username, status, pid) VALUES ('ann', 2, $$), ('ann', 6, -1),
+   ('ann', 8, $$), ('ann', 7, $$)" >/dev/null
+check "task count --downloading" "count  1" "$("$tv" task count --downloading)"
+check "task count --downloading repairs" "101" "$(q "SELECT status FROM download_queue WHERE status=101")"
+check "task count --seeding" '{"count":2}' "$("$tv" task count --seeding --json | tr -d ' \n')"
+check "task count --seeding --user is usage" 2 "$(status "$tv" task count --seeding --user ann)"
 
 # torvale user / util
 psql -q -U admin -d download -c "TRUNCATE user_setting" >/dev/null
