@@ -26,6 +26,9 @@ constexpr char kRotationHead[] =
 constexpr char kFtpDownloading[] =
     "SELECT url FROM download_queue WHERE url ILIKE 'ftp://%' AND status=2";
 
+constexpr char kDownloading[] =
+    "SELECT task_id, pid FROM download_queue WHERE status=2 or status=6";
+
 constexpr int kSizes[] = {1000, 100000, 1000000};
 // The data script has two servers to a downloading ftp:// task pair: a limit of 2
 // holds back all 50.
@@ -142,15 +145,30 @@ void BM_GetNextFtpLimit_Raw(benchmark::State &state) {
     }
 }
 
+// The downloading tasks' pid is this process, so the count repairs nothing.
+void BM_DownloadingCount(benchmark::State &state) {
+    ensure_queue(state);
+    for (auto _ : state)
+        if (DownloadTaskDownloadingCount() != 200)
+            state.SkipWithError("the count is not the 200 downloading tasks");
+}
+
+void BM_DownloadingCount_Raw(benchmark::State &state) {
+    ensure_queue(state);
+    for (auto _ : state)
+        bench::raw_exec(state, kDownloading);
+}
+
 struct Case {
     const char *name;
     void (*run)(benchmark::State &);
 };
 
 constexpr Case kCases[] = {
-    {"GetNextOldest", BM_GetNextOldest},     {"GetNextOldest_Raw", BM_GetNextOldest_Raw},
-    {"GetNextRotating", BM_GetNextRotating}, {"GetNextRotating_Raw", BM_GetNextRotating_Raw},
-    {"GetNextFtpLimit", BM_GetNextFtpLimit}, {"GetNextFtpLimit_Raw", BM_GetNextFtpLimit_Raw},
+    {"GetNextOldest", BM_GetNextOldest},       {"GetNextOldest_Raw", BM_GetNextOldest_Raw},
+    {"GetNextRotating", BM_GetNextRotating},   {"GetNextRotating_Raw", BM_GetNextRotating_Raw},
+    {"GetNextFtpLimit", BM_GetNextFtpLimit},   {"GetNextFtpLimit_Raw", BM_GetNextFtpLimit_Raw},
+    {"DownloadingCount", BM_DownloadingCount}, {"DownloadingCount_Raw", BM_DownloadingCount_Raw},
 };
 
 // Size by size, so that each queue is made once.
