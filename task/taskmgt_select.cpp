@@ -254,8 +254,9 @@ bool process_alive(int pid) noexcept {
     return kill(pid, 0) == 0 || errno == EPERM;
 }
 
-// Whether the task's worker, missing from its row's pid, has left for a good reason; the
-// task is marked failed otherwise.
+// A task whose worker has gone is fine when it finished meanwhile, or when another live
+// process took it over and stored its own pid (wget handing a torrent to rtorrent);
+// otherwise it is marked failed.
 void check_gone_worker(int task_id, int pid) {
     TV_LOG("%s (%d) The process [%d] of downloading task(%d) is gone. The status now is:%d", pid,
            task_id, DownloadTaskStatusGet(task_id));

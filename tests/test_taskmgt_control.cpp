@@ -20,24 +20,52 @@ class TaskControl : public DbTest {
 
 } // namespace
 
-TEST_F(TaskControl, DeletesCountRowsAndRefuseBadArguments) {
+TEST_F(TaskControl, SingleAndListCommandsCountWhatExisted) {
     task(0, "a", TASK_STATUS_WAITING);
     task(4, "a", TASK_STATUS_DOWNLOADING);
     task(9, "b", TASK_STATUS_FINISHED);
-    task(10, "b", TASK_STATUS_PAUSED);
+    task(10, "b", TASK_STATUS_SEEDING);
+    task(11, "b", TASK_STATUS_ERROR);
     const int ids[] = {4, 9, 12};
     EXPECT_EQ(DownloadTaskMultiDelete(ids, 3), 2);
     EXPECT_EQ(DownloadTaskMultiDelete(ids, 3), 0);
     EXPECT_EQ(DownloadTaskDelete(0), 0);
     EXPECT_EQ(DownloadTaskDelete(77), 0);
-    EXPECT_EQ(rows(), "10:3");
-    EXPECT_TRUE(logs().empty());
+    const int more[] = {10, 11, 99};
+    EXPECT_EQ(DownloadTaskPause(10), 0);
+    EXPECT_EQ(DownloadTaskMultiPause(more, 2), 0);
+    EXPECT_EQ(rows(), "10:3 11:3");
+    EXPECT_EQ(DownloadTaskContinue(11), 0);
+    EXPECT_EQ(DownloadTaskMultiContinue(more, 3), 0);
+    EXPECT_EQ(DownloadTaskPause(99), 0);
+    EXPECT_EQ(rows(), "10:1 11:1");
 
-    EXPECT_EQ(DownloadTaskMultiDelete(ids, 0), -1);
-    EXPECT_EQ(DownloadTaskMultiDelete(nullptr, 1), -1);
-    EXPECT_EQ(DownloadTaskDelete(-1), -1);
-    EXPECT_EQ(rows(), "10:3");
-    EXPECT_EQ(logs(), std::vector<std::string>(3, "taskmgt (#) Bad parameters."));
+    DownloadTaskSetting setting = {250, 7200};
+    EXPECT_EQ(DownloadTaskSettingSet(11, &setting), 1);
+    EXPECT_EQ(DownloadTaskSettingSet(99, &setting), 0);
+    EXPECT_EQ(value("SELECT string_agg(task_id || ':' || coalesce(seeding_ratio, 0) || '/' || "
+                    "coalesce(seeding_interval, 0), ' ' ORDER BY task_id) FROM download_queue"),
+              "10:0/0 11:250/7200");
+    EXPECT_TRUE(logs().empty());
+}
+
+TEST_F(TaskControl, BadArgumentsAreRefusedBeforeAnyStatement) {
+    task(1, "a", TASK_STATUS_DOWNLOADING);
+    const int ids[] = {1};
+    const DownloadTaskSetting setting = {1, 1};
+    const int rc[] = {DownloadTaskMultiDelete(ids, 0),
+                      DownloadTaskMultiDelete(nullptr, 1),
+                      DownloadTaskDelete(-1),
+                      DownloadTaskPause(-1),
+                      DownloadTaskContinue(-1),
+                      DownloadTaskMultiPause(ids, -1),
+                      DownloadTaskMultiContinue(nullptr, 1),
+                      DownloadTaskSettingSet(1, nullptr),
+                      DownloadTaskSettingSet(-1, &setting)};
+    for (int r : rc)
+        EXPECT_EQ(r, -1);
+    EXPECT_EQ(rows(), "1:2");
+    EXPECT_EQ(logs(), std::vector<std::string>(9, "taskmgt (#) Bad parameters."));
 }
 
 TEST_F(TaskControl, FailuresLogTheirStatements) {
@@ -83,28 +111,20 @@ TEST_F(TaskControl, FailuresLogTheirStatements) {
         }));
 }
 
-TEST_F(TaskControl, ResumeAllRestartsPausedAndFailedTasks) {
-    task(1, "a", TASK_STATUS_PAUSED);
-    task(2, "a", TASK_STATUS_ERROR);
-    task(3, "a", 150);
-    task(4, "a", TASK_STATUS_FINISHED);
-    task(5, "a", TASK_STATUS_DOWNLOADING);
-    task(6, "B", TASK_STATUS_PAUSED);
-    EXPECT_EQ(DownloadTaskResumeAll("A"), 0);
-    EXPECT_EQ(rows(), "1:1 2:1 3:1 4:5 5:2 6:3");
-    EXPECT_EQ(DownloadTaskResumeAll(nullptr), 0);
-    EXPECT_EQ(rows(), "1:1 2:1 3:1 4:5 5:2 6:1");
-}
-
-TEST_F(TaskControl, PauseAllPausesActiveTasksAcrossLetterCase) {
-    const int statuses[] = {1, 2, 5, 6, 7, 8, 101, 3};
-    for (int i = 0; i < 8; ++i)
+TEST_F(TaskControl, ResumeAllAndPauseAllKeepToTheirStatusesAndUser) {
+    const int statuses[] = {1, 2, 3, 5, 6, 7, 8, 101, 150};
+    for (int i = 0; i < 9; ++i)
         task(i + 1, "Alice", statuses[i]);
-    task(20, "bob", TASK_STATUS_DOWNLOADING);
-    EXPECT_EQ(DownloadTaskPauseAll("aLICE"), 0);
-    EXPECT_EQ(rows(), "1:3 2:3 3:5 4:3 5:3 6:3 7:101 8:3 20:2");
+    task(20, "bob", TASK_STATUS_PAUSED);
+    EXPECT_EQ(DownloadTaskResumeAll("aLICE"), 0);
+    EXPECT_EQ(rows(), "1:1 2:2 3:1 4:5 5:6 6:7 7:8 8:1 9:1 20:3");
+    EXPECT_EQ(DownloadTaskPauseAll("ALICE"), 0);
+    EXPECT_EQ(rows(), "1:3 2:3 3:3 4:5 5:3 6:3 7:3 8:3 9:3 20:3");
+    exec("UPDATE download_queue SET status=101 WHERE task_id=1");
+    EXPECT_EQ(DownloadTaskResumeAll(nullptr), 0);
+    EXPECT_EQ(rows(), "1:1 2:1 3:1 4:5 5:1 6:1 7:1 8:1 9:1 20:1");
     EXPECT_EQ(DownloadTaskPauseAll(nullptr), 0);
-    EXPECT_EQ(rows(), "1:3 2:3 3:5 4:3 5:3 6:3 7:101 8:3 20:3");
+    EXPECT_EQ(rows(), "1:3 2:3 3:3 4:5 5:3 6:3 7:3 8:3 9:3 20:3");
 }
 
 TEST_F(TaskControl, ClearAndDeleteAllKeepToTheirUser) {
@@ -125,36 +145,4 @@ TEST_F(TaskControl, ClearAndDeleteAllKeepToTheirUser) {
     EXPECT_EQ(DownloadTaskDeleteAll(nullptr), 0);
     EXPECT_EQ(rows(), "");
     EXPECT_TRUE(logs().empty());
-}
-
-TEST_F(TaskControl, PauseContinueAndSeedingSettingsChangeOnlyTheirTasks) {
-    task(1, "a", TASK_STATUS_DOWNLOADING);
-    task(2, "a", TASK_STATUS_SEEDING);
-    task(3, "a", TASK_STATUS_WAITING);
-    task(4, "b", TASK_STATUS_ERROR);
-    const int ids[] = {2, 3, 99};
-    EXPECT_EQ(DownloadTaskPause(1), 0);
-    EXPECT_EQ(DownloadTaskMultiPause(ids, 2), 0);
-    EXPECT_EQ(rows(), "1:3 2:3 3:3 4:101");
-    EXPECT_EQ(DownloadTaskContinue(4), 0);
-    EXPECT_EQ(DownloadTaskMultiContinue(ids, 3), 0);
-    EXPECT_EQ(DownloadTaskPause(99), 0);
-    EXPECT_EQ(rows(), "1:3 2:1 3:1 4:1");
-
-    DownloadTaskSetting setting = {250, 7200};
-    EXPECT_EQ(DownloadTaskSettingSet(3, &setting), 1);
-    EXPECT_EQ(DownloadTaskSettingSet(99, &setting), 0);
-    EXPECT_EQ(value("SELECT string_agg(task_id || ':' || coalesce(seeding_ratio, 0) || '/' || "
-                    "coalesce(seeding_interval, 0), ' ' ORDER BY task_id) FROM download_queue"),
-              "1:0/0 2:0/0 3:250/7200 4:0/0");
-    EXPECT_TRUE(logs().empty());
-
-    EXPECT_EQ(DownloadTaskPause(-1), -1);
-    EXPECT_EQ(DownloadTaskContinue(-1), -1);
-    EXPECT_EQ(DownloadTaskMultiPause(ids, 0), -1);
-    EXPECT_EQ(DownloadTaskMultiContinue(nullptr, 2), -1);
-    EXPECT_EQ(DownloadTaskSettingSet(3, nullptr), -1);
-    EXPECT_EQ(DownloadTaskSettingSet(-1, &setting), -1);
-    EXPECT_EQ(rows(), "1:3 2:1 3:1 4:1");
-    EXPECT_EQ(logs(), std::vector<std::string>(6, "taskmgt (#) Bad parameters."));
 }
