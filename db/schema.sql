@@ -35,10 +35,19 @@ CREATE TABLE IF NOT EXISTS download_queue (
 -- Next-task selection: the waiting rows that no worker holds, oldest first.
 CREATE INDEX IF NOT EXISTS download_queue_waiting_idx
     ON download_queue (task_id) WHERE status = 1 AND pid = -1;
+-- The rotation among users: the first waiting row after (or before) a user, in the
+-- order of lower(username) then task_id, is one index probe instead of a sort of every
+-- waiting row.
+CREATE INDEX IF NOT EXISTS download_queue_waiting_user_idx
+    ON download_queue (lower(username), task_id) WHERE status = 1 AND pid = -1;
 -- Per-user statements compare lower(username).
 CREATE INDEX IF NOT EXISTS download_queue_user_idx ON download_queue (lower(username));
 -- Counts and sweeps by status (downloading, seeding, paused, errors).
 CREATE INDEX IF NOT EXISTS download_queue_status_idx ON download_queue (status);
+-- Listings of the whole queue ordered by owner read a page from here instead of
+-- sorting every task (ties by task id are sorted within each owner's group). The name
+-- is never updated, so the daemon's frequent progress writes do not touch this index.
+CREATE INDEX IF NOT EXISTS download_queue_username_idx ON download_queue (username);
 
 CREATE TABLE IF NOT EXISTS user_setting (
     username            text NOT NULL,

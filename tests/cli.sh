@@ -24,6 +24,72 @@ check "conf get --json" '{"download_order":3,"download_when":"00:00-06:00","enab
   "$("$tv" conf get --json | tr -d ' \n')"
 check "conf get table" "download_when     00:00-06:00" "$("$tv" conf get | grep download_when)"
 
+# Task creation, field writes and the trigger.
+q() { psql -qAt -U admin -d download -c "$1"; }
+q "TRUNCATE download_queue, user_setting RESTART IDENTITY" >/dev/null
+q "INSERT INTO user_setting(username, uid, share_folder) VALUES ('cli''user', 1, '/volume1/cli')" >/dev/null
+check "task add magnet" '[{"destination":"/volume1/cli","filename":"Show.S01","flags":"4","source":"magnet:?xt=urn:btih:AB&dn=Show.S01&tr=x","task_id":"1"}]' \
+  "$("$tv" task add 'magnet:?xt=urn:btih:AB&dn=Show.S01&tr=x' --user "cli'user" --json | tr -d ' \n')"
+torrent=$(mktemp)
+printf 'd4:infod4:name3:abcee' >"$torrent"
+check "task add-file torrent" "2 $(basename "$torrent") 4 /dst" \
+  "$("$tv" task add-file "$torrent" --user "cli'user" --dest /dst --extra x | awk 'NR==2 {print $1, $3, $4, $5}')"
+check "task add-file kind" 0 "$(status "$tv" task add-file "$torrent" --user "cli'user" --kind 1)"
+check "task add-file to the share" "2|/volume1/cli" "$(q "SELECT task_flags || '|' || destination FROM download_queue WHERE task_id=3")"
+rm -f "$torrent"
+check "stored bytes" "21" "$(q "SELECT length(torrent) FROM download_queue WHERE task_id=2")"
+check "task add for a user without share fails" 1 "$(status "$tv" task add http://h/f --user nobody)"
+check "task add needs a link" 2 "$(status "$tv" task add --user "cli'user")"
+check "task set status and flags" 0 "$(status "$tv" task set 1 --status 3 --flags +0x30)"
+check "task set flags clear" '{"flags":48,"task_id":1}' "$("$tv" task set 1 --flags -4 --json | tr -d ' \n')"
+check "task set stored" "3|48" "$(q "SELECT status || '|' || task_flags FROM download_queue WHERE task_id=1")"
+check "task set unknown task" 1 "$(status "$tv" task set 99 --status 3)"
+check "task set bad flags" 2 "$(status "$tv" task set 1 --flags 4)"
+check "task set started 0 fails" 1 "$(status "$tv" task set 1 --started 0)"
+check "task progress forced" 0 "$(status "$tv" task progress 1 --size 500 --peers 3 --force)"
+check "task progress stored" "500|3" "$(q "SELECT current_size || '|' || total_peers FROM download_queue WHERE task_id=1")"
+check "trigger" 0 "$(status "$tv" trigger)"
+check "trigger --progress" 0 "$(status "$tv" trigger --progress)"
+
+# Next-task selection and task control.
+q "TRUNCATE download_queue, user_setting RESTART IDENTITY" >/dev/null
+q "INSERT INTO user_setting(username) VALUES ('ann'), ('Bob'), ('off')" >/dev/null
+q "UPDATE user_setting SET user_disabled=true WHERE username='off'" >/dev/null
+q "INSERT INTO download_queue(username, status, pid, url) VALUES ('ann', 1, -1, 'http://h/1'),
+   ('ann', 1, -1, 'http://h/2'), ('bob', 1, -1, 'ftp://f/3'), ('off', 1, -1, 'http://h/4'),
+   ('bob', 2, 1, 'ftp://f/5')" >/dev/null
+check "task next" "task_id    1" "$("$tv" task next | head -1)"
+check "task next --rotate after ann" '{"last_user":"bob","task_id":3}' \
+  "$("$tv" task next --rotate --after ann --json | tr -d ' \n')"
+check "task next --rotate wraps" '{"last_user":"ann","task_id":1}' \
+  "$("$tv" task next --rotate --after bob --json | tr -d ' \n')"
+check "task pause" "task_ids  1 2" "$("$tv" task pause 1 2 | tail -1)"
+check "task next skips paused" "task_id    3" "$("$tv" task next | head -1)"
+check "task next --ftp-limit" "task_id    0" "$("$tv" task next --ftp-limit 1 | head -1)"
+check "task continue" '{"done":"continue","task_ids":[2]}' "$("$tv" task continue 2 --json | tr -d ' \n')"
+check "task pause negative id" 2 "$(status "$tv" task pause -1)"
+check "task seeding" 0 "$(status "$tv" task seeding 2 --ratio 150 --interval 600)"
+check "task seeding stored" "150|600" "$(q "SELECT seeding_ratio || '|' || seeding_interval FROM download_queue WHERE task_id=2")"
+check "task seeding unknown task" 1 "$(status "$tv" task seeding 99 --ratio 1 --interval 1)"
+q "UPDATE download_queue SET status=5 WHERE task_id IN (2, 3)" >/dev/null
+check "task clear --user" 0 "$(status "$tv" task clear --user ANN)"
+check "task clear kept the others" "1:3 3:5 4:1 5:2" \
+  "$(q "SELECT string_agg(task_id || ':' || status, ' ' ORDER BY task_id) FROM download_queue")"
+check "task resume-all" 0 "$(status "$tv" task resume-all)"
+check "task pause-all --user" 0 "$(status "$tv" task pause-all --user bob)"
+check "task bulk results" "1:1 3:5 4:1 5:3" \
+  "$(q "SELECT string_agg(task_id || ':' || status, ' ' ORDER BY task_id) FROM download_queue")"
+check "task delete" '{"deleted":1}' "$("$tv" task delete 4 44 --json | tr -d ' \n')"
+check "task delete-all asks for --yes" 2 "$(status "$tv" task delete-all)"
+check "task delete-all" 0 "$(status "$tv" task delete-all --yes)"
+check "task next on an empty queue" "task_id    0" "$("$tv" task next | head -1)"
+q "INSERT INTO download_queue(username, status, pid) VALUES ('ann', 2, $$), ('ann', 6, -1),
+   ('ann', 8, $$), ('ann', 7, $$)" >/dev/null
+check "task count --downloading" "count  1" "$("$tv" task count --downloading)"
+check "task count --downloading repairs" "101" "$(q "SELECT status FROM download_queue WHERE status=101")"
+check "task count --seeding" '{"count":2}' "$("$tv" task count --seeding --json | tr -d ' \n')"
+check "task count --seeding --user is usage" 2 "$(status "$tv" task count --seeding --user ann)"
+
 # torvale user / util
 psql -q -U admin -d download -c "TRUNCATE user_setting" >/dev/null
 cliuser="tvcli$$"
@@ -54,33 +120,6 @@ touch "$freedir/a.tar.gz"
 check "free-name numbers before the extension" "path  $freedir/a.tar1.gz" "$("$tv" util free-name "$freedir" a.tar.gz)"
 check "free-name of a free name" "path  $freedir/b" "$("$tv" util free-name "$freedir" b)"
 rm -rf "$freedir"
-
-# Task creation, field writes and the trigger.
-q() { psql -qAt -U admin -d download -c "$1"; }
-q "TRUNCATE download_queue, user_setting RESTART IDENTITY" >/dev/null
-q "INSERT INTO user_setting(username, uid, share_folder) VALUES ('cli''user', 1, '/volume1/cli')" >/dev/null
-check "task add magnet" '[{"destination":"/volume1/cli","filename":"Show.S01","flags":"4","source":"magnet:?xt=urn:btih:AB&dn=Show.S01&tr=x","task_id":"1"}]' \
-  "$("$tv" task add 'magnet:?xt=urn:btih:AB&dn=Show.S01&tr=x' --user "cli'user" --json | tr -d ' \n')"
-torrent=$(mktemp)
-printf 'd4:infod4:name3:abcee' >"$torrent"
-check "task add-file torrent" "2 $(basename "$torrent") 4 /dst" \
-  "$("$tv" task add-file "$torrent" --user "cli'user" --dest /dst --extra x | awk 'NR==2 {print $1, $3, $4, $5}')"
-check "task add-file kind" 0 "$(status "$tv" task add-file "$torrent" --user "cli'user" --kind 1)"
-check "task add-file to the share" "2|/volume1/cli" "$(q "SELECT task_flags || '|' || destination FROM download_queue WHERE task_id=3")"
-rm -f "$torrent"
-check "stored bytes" "21" "$(q "SELECT length(torrent) FROM download_queue WHERE task_id=2")"
-check "task add for a user without share fails" 1 "$(status "$tv" task add http://h/f --user nobody)"
-check "task add needs a link" 2 "$(status "$tv" task add --user "cli'user")"
-check "task set status and flags" 0 "$(status "$tv" task set 1 --status 3 --flags +0x30)"
-check "task set flags clear" '{"flags":48,"task_id":1}' "$("$tv" task set 1 --flags -4 --json | tr -d ' \n')"
-check "task set stored" "3|48" "$(q "SELECT status || '|' || task_flags FROM download_queue WHERE task_id=1")"
-check "task set unknown task" 1 "$(status "$tv" task set 99 --status 3)"
-check "task set bad flags" 2 "$(status "$tv" task set 1 --flags 4)"
-check "task set started 0 fails" 1 "$(status "$tv" task set 1 --started 0)"
-check "task progress forced" 0 "$(status "$tv" task progress 1 --size 500 --peers 3 --force)"
-check "task progress stored" "500|3" "$(q "SELECT current_size || '|' || total_peers FROM download_queue WHERE task_id=1")"
-check "trigger" 0 "$(status "$tv" trigger)"
-check "trigger --progress" 0 "$(status "$tv" trigger --progress)"
 
 [ $fails -eq 0 ] && echo "CLI checks passed"
 exit $fails

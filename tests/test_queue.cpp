@@ -250,14 +250,14 @@ TEST_F(Queue, FailingStatementsAreLoggedWhole) {
         "SELECT " + cols + " FROM download_queue WHERE task_id > 0 ORDER BY task_id asc  LIMIT 3 ",
         "SELECT " + cols +
             ", ((current_size::float/total_size::float)*100) as progress FROM download_queue "
-            "WHERE (task_id > 0) and total_size != 0 UNION SELECT " +
+            "WHERE (task_id > 0) and total_size != 0 UNION ALL SELECT " +
             cols +
             ", 0 as progress FROM download_queue WHERE (task_id > 0) and total_size = 0 "
             "ORDER BY progress asc, task_id asc LIMIT 3 OFFSET 4",
         "SELECT " + cols +
             ", ((total_size::float-current_size::float)/current_rate::float) as time_left FROM "
             "download_queue WHERE (task_id > 0) and status = 2 and total_size != 0 and "
-            "current_rate > 512 UNION SELECT " +
+            "current_rate > 512 UNION ALL SELECT " +
             cols +
             ", 9999999999 as time_left FROM download_queue WHERE (task_id > 0) and (status != 2 "
             "or total_size = 0 or current_rate <= 512) ORDER BY time_left desc, status desc, "
