@@ -4,6 +4,7 @@
 #include <cstdio>
 #include <cstring>
 #include <memory>
+#include <new>
 
 #include "db/access.h"
 #include "platform/log.h"
@@ -42,9 +43,13 @@ std::string format(const char *fmt, ...) {
     va_copy(copy, ap);
     int len = std::vsnprintf(nullptr, 0, fmt, ap);
     va_end(ap);
-    std::string out(len > 0 ? static_cast<size_t>(len) : 0, '\0');
-    if (len > 0)
-        std::vsnprintf(out.data(), out.size() + 1, fmt, copy);
+    if (len < 0) {
+        // Past INT_MAX bytes: an empty statement must never stand in for the real one.
+        va_end(copy);
+        throw std::bad_alloc();
+    }
+    std::string out(static_cast<size_t>(len), '\0');
+    std::vsnprintf(out.data(), out.size() + 1, fmt, copy);
     va_end(copy);
     return out;
 }
