@@ -1,9 +1,11 @@
+#include <cctype>
 #include <cstring>
 #include <string>
 #include <vector>
 
 #include "record/taskset_read.h"
 #include "tests/fixture.h"
+#include "tests/test_platform_support.h"
 #include "torvale/task.h"
 
 namespace {
@@ -199,4 +201,74 @@ TEST_F(TaskTotals, FailingStatementsAreLoggedPerForm) {
                               0),
               0u)
         << logs()[2];
+}
+
+class TaskRate : public DbTest {
+  protected:
+    HostGroup admins_{"administrators"};
+    HostUser admin_;
+    HostUser plain_;
+
+    void SetUp() override {
+        DbTest::SetUp();
+        admins_.add(admin_);
+        // Rates in powers of two, so each sum says which statuses it took.
+        std::string values;
+        int bit = 0;
+        for (const std::string &user : {plain_.name(), upper(plain_.name()), admin_.name()})
+            for (int status : {1, 2, 3, 5, 6, 7, 8, 101, 4}) {
+                values += (values.empty() ? "('" : ", ('") + user + "', " + std::to_string(status) +
+                          ", " + std::to_string(1 << bit) + ", " + std::to_string(1 << (bit + 1)) +
+                          ")";
+                bit = (bit + 2) % 28;
+            }
+        exec("INSERT INTO download_queue(username, status, current_rate, upload_rate) VALUES " +
+             values);
+    }
+    static std::string upper(std::string s) {
+        for (char &c : s)
+            c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+        return s;
+    }
+    std::string sums(const std::string &where) {
+        return value("SELECT coalesce(sum(current_rate), 0) || ' ' || coalesce(sum(upload_rate), "
+                     "0) FROM download_queue WHERE status IN (2, 7, 8) " +
+                     where);
+    }
+};
+
+TEST_F(TaskRate, AdministratorsSeeEveryonesActiveTasksOthersTheirOwn) {
+    int dl = -1, ul = -1;
+    ASSERT_EQ(DownloadTotalRateGet(admin_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(std::to_string(dl) + " " + std::to_string(ul), sums(""));
+
+    ASSERT_EQ(DownloadTotalRateGet(plain_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(std::to_string(dl) + " " + std::to_string(ul),
+              sums("AND lower(username)=lower('" + plain_.name() + "')"));
+    EXPECT_NE(sums("AND lower(username)=lower('" + plain_.name() + "')"), sums(""));
+    EXPECT_TRUE(logs().empty());
+
+    // Nothing downloading or seeding: both rates 0, and still success.
+    exec("UPDATE download_queue SET status=6 WHERE status IN (2, 7, 8)");
+    ASSERT_EQ(DownloadTotalRateGet(admin_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(dl, 0);
+    EXPECT_EQ(ul, 0);
+    dl = ul = -1;
+    ASSERT_EQ(DownloadTotalRateGet(plain_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(dl, 0);
+    EXPECT_EQ(ul, 0);
+}
+
+TEST_F(TaskRate, RefusalsAndUnknownUsersLeaveTheRatesAlone) {
+    int dl = 7, ul = 9;
+    EXPECT_EQ(DownloadTotalRateGet(nullptr, &dl, &ul), -1);
+    EXPECT_EQ(DownloadTotalRateGet(plain_.c_str(), nullptr, &ul), -1);
+    EXPECT_EQ(DownloadTotalRateGet(plain_.c_str(), &dl, nullptr), -1);
+    EXPECT_EQ(DownloadTotalRateGet("no-such-user-anywhere", &dl, &ul), -1);
+    EXPECT_EQ(dl, 7);
+    EXPECT_EQ(ul, 9);
+    EXPECT_EQ(logs(), (S{"taskget (#) Bad parameter.", "taskget (#) Bad parameter.",
+                         "taskget (#) Bad parameter.",
+                         "taskget:# Failed to check admin group, user [no-such-user-anywhere]. "
+                         "[0x1D00]"}));
 }
