@@ -251,6 +251,13 @@ void count(const std::optional<std::string> &user) {
     cli::print_record({{"count", n}});
 }
 
+void rate(const std::string &user) {
+    int download = 0, upload = 0;
+    if (DownloadTotalRateGet(user.c_str(), &download, &upload) == -1)
+        cli::fail("no rates for " + user + ": not a host user, or no database (see syslog)");
+    cli::print_record({{"download_rate", download}, {"upload_rate", upload}});
+}
+
 void setup() {
     CLI::App &task = cli::family("task", "Download tasks");
 
@@ -283,6 +290,13 @@ void setup() {
     CLI::App *cnt = task.add_subcommand("count", "Count tasks");
     cnt->add_option("--user", *user, "Only this user's tasks (letter case ignored)");
     cnt->callback([user] { count(*user); });
+
+    auto name = std::make_shared<std::string>();
+    CLI::App *rt = task.add_subcommand(
+        "rate", "Summed rates of downloading and seeding tasks: all users' for an "
+                "administrator, else the user's own");
+    rt->add_option("user", *name, "Host user name")->required();
+    rt->callback([name] { rate(*name); });
 }
 
 cli::Registration reg(setup);
