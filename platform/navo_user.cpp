@@ -95,7 +95,9 @@ bool in_group_list(const char *user, gid_t primary, gid_t wanted) {
             groups.resize(static_cast<size_t>(n));
             break;
         }
-        // n now holds the number needed.
+        // n now holds the number needed; a list that keeps growing is a broken source.
+        if (groups.size() >= 65536)
+            return false;
         groups.resize(static_cast<size_t>(n) > groups.size() ? static_cast<size_t>(n)
                                                              : groups.size() * 2);
     }

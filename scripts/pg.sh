@@ -32,7 +32,16 @@ as_server() {
   if [ "$(id -u)" -eq 0 ]; then runuser -u postgres -- "$@"; else "$@"; fi
 }
 
-running() { [ -f "$data/PG_VERSION" ] && as_server "$bin/pg_ctl" -D "$data" status >/dev/null 2>&1; }
+# The pid file names a live server only if that process is a postgres that has not
+# died (a killed server can linger as a zombie where nothing reaps it, and its pid can
+# be reused by another program).
+running() {
+  local pid state
+  pid=$(head -n 1 "$data/postmaster.pid" 2>/dev/null) || return 1
+  [ -n "$pid" ] && [ -r "/proc/$pid/stat" ] || return 1
+  state=$(sed 's/.*) //' "/proc/$pid/stat" | cut -d' ' -f1)
+  [ "$state" != Z ] && tr '\0' ' ' <"/proc/$pid/cmdline" | grep -q postgres
+}
 
 case $cmd in
   env)
@@ -66,9 +75,14 @@ case $cmd in
     if ! running; then
       # A pid file left by a server that is gone would stop pg_ctl from starting.
       as_server rm -f "$data/postmaster.pid"
-      as_server "$bin/pg_ctl" -D "$data" -l "$dir/server.log" -w start >/dev/null
+      # Workers of a killed server hold its shared memory until they notice and exit.
+      for try in 1 2 3 4 5 6 7 8 9 10; do
+        as_server "$bin/pg_ctl" -D "$data" -l "$dir/server.log" -w start >/dev/null && break
+        [ $try -lt 10 ] || { tail -n 5 "$dir/server.log" >&2; exit 1; }
+        sleep 1
+      done
     fi
-    export PGHOST=$sock PGPORT=$port
+    export PGHOST=$sock PGPORT=$port PGOPTIONS="-c client_min_messages=warning"
     if [ -z "$(psql -U admin -d postgres -tAc "SELECT 1 FROM pg_database WHERE datname='download'")" ]; then
       psql -q -U admin -d postgres -c "CREATE DATABASE download ENCODING 'UTF8' TEMPLATE template0" >/dev/null
     fi

@@ -14,7 +14,7 @@ eval "$(scripts/pg.sh env)"
 torvale=build/torvale
 $torvale db init
 $torvale conf set --when "00:00-23:59" --order 1 --seeding-ratio 100 --seeding-interval 3600
-$torvale conf get
+$torvale conf get --json
 
 echo
 echo "The embedded database is running. To use it from a shell:"

@@ -1,7 +1,6 @@
 #include <fstream>
 #include <sstream>
 #include <string>
-#include <sys/stat.h>
 #include <sys/vfs.h>
 #include <vector>
 
@@ -21,16 +20,15 @@ class Shares : public ScratchDir {
         if (NAVOShareGet(name, &raw) != 0)
             return "<none>";
         torvale::platform::Share s(raw);
-        std::ostringstream out;
-        out << s->path << " " << s->status;
-        return out.str();
+        return s->path + " " + std::to_string(s->status);
     }
-    std::vector<std::string> mounted_at(const char *path, int &count) {
+    std::vector<std::string> mounted_at(const char *path) {
         torvale::platform::SzList list(NLIBCSzListAlloc(8));
-        count = NAVOShareEnumByMntPath(list.get(), path);
+        int count = NAVOShareEnumByMntPath(list.get(), path);
         std::vector<std::string> out;
         for (int i = 0; i < NLIBCSzListCount(list.get()); ++i)
             out.emplace_back(NLIBCSzListGet(list.get(), i));
+        EXPECT_EQ(count, static_cast<int>(out.size()));
         return out;
     }
 };
@@ -38,57 +36,37 @@ class Shares : public ScratchDir {
 using MediaIndex = ScratchDir;
 
 std::string read_all(const std::string &path) {
-    std::ifstream in(path);
     std::stringstream ss;
-    ss << in.rdbuf();
+    ss << std::ifstream(path).rdbuf();
     return ss.str();
 }
 
 } // namespace
 
 TEST_F(Shares, RegistryLinesGivePathAndFlagsAndMalformedLinesAreSkipped) {
-    registry("# name\tpath\tflags\n"
-             "video\t/volume1/video\t0\n"
-             "\n"
+    registry("# name\tpath\tflags\n\n"
              "secret\t/volume1/secret\t0x4\n"
              "locked\t/volume2/locked\t2\r\n"
+             "vidéo 2\t/volume1/vidéo 2\t010\n"
              "broken\t/volume1/broken\n"
              "badflags\t/volume1/b\tlots\n"
-             "negative\t/volume1/n\t-1\n"
-             "\t/volume1/noname\t0\n"
-             "usb\t/volumeUSB1/usbshare1\t0\n"
-             "vidéo 2\t/volume1/vidéo 2\t010\n");
-    EXPECT_EQ(share("video"), "/volume1/video 0");
+             "usbshare1\t/volumeUSB1/usbshare1\t0\n"
+             "photos\t/volumeUSB1/usbshare1\t0\n"
+             "sub\t/volumeUSB1/usbshare1/sub\t0\n");
     EXPECT_EQ(share("secret"), "/volume1/secret 4");
     EXPECT_EQ(share("locked"), "/volume2/locked 2");
     EXPECT_EQ(share("vidéo 2"), "/volume1/vidéo 2 8");
-    EXPECT_EQ(share("usb"), "/volumeUSB1/usbshare1 0");
-    NLIBCErrSet(0);
     EXPECT_EQ(share("broken"), "<none>");
     EXPECT_EQ(NLIBCErrGet(), kNavoErrNoSuchShare);
     EXPECT_EQ(share("badflags"), "<none>");
-    EXPECT_EQ(share("negative"), "<none>");
-    EXPECT_EQ(share("Video"), "<none>");
-    EXPECT_EQ(share(""), "<none>");
-}
-
-TEST_F(Shares, EnumeratingAMountPathListsEveryShareThereInOrder) {
-    registry("usbshare1\t/volumeUSB1/usbshare1\t0\n"
-             "photos\t/volumeUSB1/usbshare1\t0\n"
-             "other\t/volumeUSB1/usbshare1/sub\t0\n");
-    int count = 0;
-    EXPECT_EQ(mounted_at("/volumeUSB1/usbshare1", count),
+    EXPECT_EQ(share("Secret"), "<none>");
+    EXPECT_EQ(mounted_at("/volumeUSB1/usbshare1"),
               (std::vector<std::string>{"usbshare1", "photos"}));
-    EXPECT_EQ(count, 2);
-    EXPECT_TRUE(mounted_at("/volumeUSB1/usbshare1/", count).empty());
-    EXPECT_EQ(count, 0);
-    EXPECT_EQ(NAVOShareEnumByMntPath(nullptr, "/x"), -1);
+    EXPECT_TRUE(mounted_at("/volumeUSB1/usbshare1/").empty());
 }
 
 TEST_F(Shares, AHostWithoutARegistryHasNoShares) {
-    int count = -5;
-    EXPECT_TRUE(mounted_at("/volume1/video", count).empty());
-    EXPECT_EQ(count, 0);
+    EXPECT_TRUE(mounted_at("/volume1/video").empty());
     EXPECT_EQ(share("video"), "<none>");
     EXPECT_EQ(NLIBCErrGet(), kNavoErrNoSuchShare);
 }
@@ -100,29 +78,22 @@ TEST(PlatformFsType, OwnershipFreeFileSystemsAreOneAndFour) {
     EXPECT_EQ(fs_type_code(0x5346544e), 4); // ntfs, ntfs3
     EXPECT_EQ(fs_type_code(0x65735546), 4); // fuseblk
     EXPECT_EQ(fs_type_code(0xEF53), 2);     // ext4
-    EXPECT_EQ(fs_type_code(0x9123683E), 3); // btrfs
     EXPECT_EQ(fs_type_code(0x01021994), 0); // tmpfs
-
     struct statfs st;
     ASSERT_EQ(statfs("/tmp", &st), 0);
     EXPECT_EQ(NAVOGetFSType("/tmp", 0),
               fs_type_code(static_cast<unsigned long>(st.f_type) & 0xffffffffUL));
     EXPECT_EQ(NAVOGetFSType("/no/such/path", 0), -1);
-    EXPECT_EQ(NAVOGetFSType(nullptr, 0), -1);
 }
 
 TEST_F(MediaIndex, RequestsAreQueuedAsKindAndPathLines) {
     EXPECT_EQ(NLIBNavoIndexAdd("/volume1/video/film.mkv", 1), 0);
     EXPECT_EQ(NLIBNavoIndexAdd("/volume1/video/it's 映画", 3), 0);
     EXPECT_EQ(NLIBNavoFileIndexAdd("/volume1/video/film.mkv", 0, 1), 0);
-    EXPECT_EQ(read_all(dir_ + "/var/spool/torvale/index"),
-              "1 /volume1/video/film.mkv\n3 /volume1/video/it's 映画\n");
-    EXPECT_EQ(read_all(dir_ + "/var/spool/torvale/fileindex"), "1 /volume1/video/film.mkv\n");
-
     // A line break would forge a second request.
     EXPECT_EQ(NLIBNavoIndexAdd("/v/a\n1 /etc/shadow", 1), -1);
     EXPECT_EQ(NLIBNavoIndexAdd("/v/a", 2), -1);
-    EXPECT_EQ(NLIBNavoIndexAdd(nullptr, 1), -1);
-    EXPECT_EQ(NLIBNavoFileIndexAdd("/v/a", 1, 1), -1);
+    EXPECT_EQ(read_all(dir_ + "/var/spool/torvale/index"),
+              "1 /volume1/video/film.mkv\n3 /volume1/video/it's 映画\n");
     EXPECT_EQ(read_all(dir_ + "/var/spool/torvale/fileindex"), "1 /volume1/video/film.mkv\n");
 }

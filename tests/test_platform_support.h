@@ -10,33 +10,21 @@
 
 #include "tests/fixture.h"
 
-// A fresh name no host account has: the prefix, this process and a counter.
-inline std::string unique_account_name(const std::string &prefix) {
-    static int counter = 0;
-    return prefix + std::to_string(getpid()) + "x" + std::to_string(++counter);
-}
-
-// A user without home directory or own group; `group` makes it the primary group.
+// A user without home directory or own group, named after this process and a counter;
+// `group` makes that group its primary one.
 class HostUser {
   public:
-    explicit HostUser(const std::string &group = "") : name_(unique_account_name("tvu")) {
-        std::string opts = group.empty() ? "-N" : "-g " + group;
-        EXPECT_EQ(run_shell("useradd -M " + opts + " " + name_ + " >/dev/null 2>&1"), 0) << name_;
+    explicit HostUser(const std::string &group = "") {
+        static int counter = 0;
+        name_ = "tvu" + std::to_string(getpid()) + "x" + std::to_string(++counter);
+        std::string opts = group.empty() ? "-N " : "-g " + group + " ";
+        EXPECT_EQ(run_shell("useradd -M " + opts + name_ + " >/dev/null 2>&1"), 0) << name_;
     }
     ~HostUser() { run_shell("userdel " + name_ + " >/dev/null 2>&1"); }
-    HostUser(const HostUser &) = delete;
-    HostUser &operator=(const HostUser &) = delete;
 
     const std::string &name() const { return name_; }
     const char *c_str() const { return name_.c_str(); }
-    uid_t uid() const {
-        const passwd *pw = getpwnam(name_.c_str());
-        return pw != nullptr ? pw->pw_uid : static_cast<uid_t>(-1);
-    }
-    gid_t gid() const {
-        const passwd *pw = getpwnam(name_.c_str());
-        return pw != nullptr ? pw->pw_gid : static_cast<gid_t>(-1);
-    }
+    const passwd &entry() const { return *getpwnam(name_.c_str()); }
 
   private:
     std::string name_;
@@ -46,22 +34,18 @@ class HostUser {
 class HostGroup {
   public:
     explicit HostGroup(const std::string &name) : name_(name) {
-        if (run_shell("getent group " + name_ + " >/dev/null") != 0) {
-            EXPECT_EQ(run_shell("groupadd " + name_ + " >/dev/null 2>&1"), 0) << name_;
-            created_ = true;
+        created_ = run_shell("getent group " + name_ + " >/dev/null") != 0;
+        if (created_) {
+            EXPECT_EQ(run_shell("groupadd " + name_), 0);
         }
     }
     ~HostGroup() {
         if (created_)
-            run_shell("groupdel " + name_ + " >/dev/null 2>&1");
+            run_shell("groupdel " + name_);
     }
-    HostGroup(const HostGroup &) = delete;
-    HostGroup &operator=(const HostGroup &) = delete;
-
     void add(const HostUser &user) {
-        EXPECT_EQ(run_shell("gpasswd -a " + user.name() + " " + name_ + " >/dev/null 2>&1"), 0);
+        EXPECT_EQ(run_shell("gpasswd -a " + user.name() + " " + name_ + " >/dev/null"), 0);
     }
-    const std::string &name() const { return name_; }
 
   private:
     std::string name_;

@@ -1,3 +1,4 @@
+#include <cctype>
 #include <cstring>
 #include <string>
 
@@ -6,14 +7,15 @@
 
 namespace {
 
+constexpr char kUnknown[] = "user:# Failed to get user [tv-no-such-user][0x1D00]";
+
 class UserSettings : public DbTest {
   protected:
     // The row of `user` as "uid|share|disabled|watch|delete|folder", "<none>" without one.
     std::string row(const std::string &user) {
         return value("SELECT uid || '|' || share_folder || '|' || user_disabled::int || '|' || "
                      "enable_watchffolder::int || '|' || delete_watchtorrent::int || '|' || "
-                     "watchfolder "
-                     "FROM user_setting WHERE username = '" +
+                     "watchfolder FROM user_setting WHERE username = '" +
                      user + "'");
     }
     void insert(const std::string &user, const std::string &folder, bool watch, bool disabled) {
@@ -22,18 +24,21 @@ class UserSettings : public DbTest {
              user + "', 1, " + (disabled ? "true" : "false") + ", " + (watch ? "true" : "false") +
              ", '" + folder + "')");
     }
+    // The user's watch settings as "rc enabled delete folder", starting from ints of 7.
+    std::string watch(const std::string &user) {
+        int enabled = 7, del = 7;
+        char folder[8] = "x";
+        int rc = DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder);
+        return std::to_string(rc) + " " + std::to_string(enabled) + " " + std::to_string(del) +
+               " " + folder;
+    }
 };
 
-struct Share {
-    int rc;
-    std::string text;
-};
-
-Share share_of(const std::string &user) {
+std::string share_of(const std::string &user) {
     char buf[64];
     std::memset(buf, 'x', sizeof buf);
     int rc = DownloadUserShareGet(user.c_str(), buf, sizeof buf);
-    return {rc, std::string(buf, strnlen(buf, sizeof buf))};
+    return std::to_string(rc) + " " + std::string(buf, strnlen(buf, sizeof buf));
 }
 
 std::string upper(std::string s) {
@@ -46,114 +51,75 @@ std::string upper(std::string s) {
 
 TEST_F(UserSettings, FirstShareSetInsertsWithThePlatformUidLaterOnesUpdate) {
     HostUser user;
+    std::string uid = std::to_string(user.entry().pw_uid);
     ASSERT_EQ(DownloadUserShareSet(user.c_str(), "video"), 0);
-    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|0|0|");
+    EXPECT_EQ(row(user.name()), uid + "|video|0|0|0|");
     // Another letter case finds the same row; only the share changes.
     exec("UPDATE user_setting SET uid = 7, user_disabled = true");
     ASSERT_EQ(DownloadUserShareSet(upper(user.name()).c_str(), "it's \"映画\""), 0);
     EXPECT_EQ(count("SELECT * FROM user_setting"), 1);
     EXPECT_EQ(row(user.name()), "7|it's \"映画\"|1|0|0|");
     EXPECT_TRUE(logs().empty());
+
+    EXPECT_EQ(DownloadUserShareSet("tv-no-such-user", "video"), -1);
+    EXPECT_EQ(count("SELECT * FROM user_setting"), 1);
+    EXPECT_EQ(logs(), std::vector<std::string>{kUnknown});
 }
 
 TEST_F(UserSettings, ShareGetReportsEnabledDisabledAndAbsentUsers) {
     HostUser user;
     ASSERT_EQ(DownloadUserShareSet(user.c_str(), "downloads/it's"), 0);
-    Share got = share_of(upper(user.name()));
-    EXPECT_EQ(got.rc, 1);
-    EXPECT_EQ(got.text, "downloads/it's");
-
+    EXPECT_EQ(share_of(upper(user.name())), "1 downloads/it's");
     ASSERT_EQ(DownloadUserDisable(user.c_str(), 1), 0);
-    got = share_of(user.name());
-    EXPECT_EQ(got.rc, 2);
-    EXPECT_EQ(got.text, "downloads/it's");
-
-    got = share_of("nobody-here");
-    EXPECT_EQ(got.rc, 0);
-    EXPECT_EQ(got.text, "");
-
-    // Cut to the buffer and terminated.
+    EXPECT_EQ(share_of(user.name()), "2 downloads/it's");
+    EXPECT_EQ(share_of("nobody-here"), "0 ");
     char small[5];
     EXPECT_EQ(DownloadUserShareGet(user.c_str(), small, sizeof small), 2);
     EXPECT_STREQ(small, "down");
     EXPECT_TRUE(logs().empty());
 }
 
-TEST_F(UserSettings, ShareCallsRefuseBadArgumentsAndUnknownUsers) {
-    char buf[8] = "keep";
-    EXPECT_EQ(DownloadUserShareGet(nullptr, buf, sizeof buf), -1);
-    EXPECT_EQ(DownloadUserShareGet("", buf, sizeof buf), -1);
-    EXPECT_EQ(DownloadUserShareGet("a", nullptr, 8), -1);
-    EXPECT_EQ(DownloadUserShareGet("a", buf, 0), -1);
-    EXPECT_STREQ(buf, "keep");
-    EXPECT_EQ(DownloadUserShareSet("a", ""), -1);
-    EXPECT_EQ(DownloadUserShareSet(nullptr, "video"), -1);
-    EXPECT_EQ(logs().size(), 6u);
-    EXPECT_TRUE(logged("user (#) Bad parameters."));
-    clear_logs();
-
-    EXPECT_EQ(DownloadUserShareSet("tv-no-such-user", "video"), -1);
-    EXPECT_EQ(count("SELECT * FROM user_setting"), 0);
-    EXPECT_EQ(logs(),
-              std::vector<std::string>{"user:# Failed to get user [tv-no-such-user][0x1D00]"});
-}
-
 TEST_F(UserSettings, WatchOffForANewUserInsertsAnEmptySwitchedOffRow) {
     HostUser user;
     ASSERT_EQ(DownloadUserWatchInfoSet(user.c_str(), 0, 1, nullptr), 0);
-    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "||0|0|1|");
-
-    int enabled = 7, del = 7;
-    char folder[32] = "x";
-    EXPECT_EQ(DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder), 1);
-    EXPECT_EQ(enabled, 0);
-    EXPECT_EQ(del, 1);
-    EXPECT_STREQ(folder, "");
+    EXPECT_EQ(row(user.name()), std::to_string(user.entry().pw_uid) + "||0|0|1|");
+    EXPECT_EQ(watch(user.name()), "1 0 1 ");
+    EXPECT_EQ(watch("nobody-here"), "0 7 7 ");
 }
 
 TEST_F(UserSettings, WatchOnStoresFolderAndFlagOffKeepsThem) {
     HostUser user;
+    std::string uid = std::to_string(user.entry().pw_uid);
     ASSERT_EQ(DownloadUserShareSet(user.c_str(), "video"), 0);
     ASSERT_EQ(DownloadUserWatchInfoSet(upper(user.name()).c_str(), 1, 1, "/volume1/it's/w"), 0);
-    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|1|1|/volume1/it's/w");
+    EXPECT_EQ(row(user.name()), uid + "|video|0|1|1|/volume1/it's/w");
     ASSERT_EQ(DownloadUserWatchInfoSet(user.c_str(), 0, 0, nullptr), 0);
-    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|0|1|/volume1/it's/w");
-
-    // Values left over in the caller's ints never read as set.
-    int enabled = 1, del = 1;
-    char folder[8];
-    EXPECT_EQ(DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder), 1);
-    EXPECT_EQ(enabled, 0);
-    EXPECT_EQ(del, 1);
-    EXPECT_STREQ(folder, "/volume");
+    EXPECT_EQ(row(user.name()), uid + "|video|0|0|1|/volume1/it's/w");
+    // Cut to the buffer; a false flag is written as 0, never left at the caller's 7.
+    EXPECT_EQ(watch(user.name()), "1 0 1 /volume");
     ASSERT_EQ(DownloadUserWatchInfoSet(user.c_str(), 1, 0, "/w"), 0);
-    EXPECT_EQ(DownloadUserWatchInfoGet(user.c_str(), &enabled, &del, folder, sizeof folder), 1);
-    EXPECT_EQ(enabled, 1);
-    EXPECT_EQ(del, 0);
-    EXPECT_STREQ(folder, "/w");
+    EXPECT_EQ(watch(user.name()), "1 1 0 /w");
     EXPECT_TRUE(logs().empty());
 }
 
-TEST_F(UserSettings, WatchCallsRefuseBadArguments) {
-    int enabled = 5, del = 5;
-    char folder[8] = "keep";
-    EXPECT_EQ(DownloadUserWatchInfoGet("nobody-here", &enabled, &del, folder, sizeof folder), 0);
-    EXPECT_STREQ(folder, "");
-    EXPECT_EQ(enabled, 5);
-    EXPECT_TRUE(logs().empty());
-
-    EXPECT_EQ(DownloadUserWatchInfoGet("a", nullptr, &del, folder, sizeof folder), -1);
-    EXPECT_EQ(DownloadUserWatchInfoGet("a", &enabled, nullptr, folder, sizeof folder), -1);
-    EXPECT_EQ(DownloadUserWatchInfoGet("a", &enabled, &del, nullptr, 8), -1);
-    EXPECT_EQ(DownloadUserWatchInfoGet("", &enabled, &del, folder, sizeof folder), -1);
+TEST_F(UserSettings, BadArgumentsAreRefusedBeforeAnyStatement) {
+    int n = 0;
+    char buf[8] = "keep";
+    EXPECT_EQ(DownloadUserShareGet("", buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadUserShareGet("a", buf, 0), -1);
+    EXPECT_EQ(DownloadUserShareSet("a", ""), -1);
+    EXPECT_EQ(DownloadUserWatchInfoGet("a", nullptr, &n, buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadUserWatchInfoGet("a", &n, nullptr, buf, sizeof buf), -1);
     EXPECT_EQ(DownloadUserWatchInfoSet("a", 1, 0, ""), -1);
-    EXPECT_EQ(DownloadUserWatchInfoSet("a", 1, 0, nullptr), -1);
     EXPECT_EQ(DownloadUserWatchInfoSet(nullptr, 0, 0, nullptr), -1);
-    EXPECT_EQ(logs(), std::vector<std::string>(7, "user (#) Bad parameters."));
+    EXPECT_EQ(DownloadCheckWatchfolder("a", nullptr), -1);
+    EXPECT_EQ(DownloadUserDisable("", 1), -1);
+    EXPECT_STREQ(buf, "keep");
+    EXPECT_EQ(logs(), std::vector<std::string>(9, "user (#) Bad parameters."));
     clear_logs();
     EXPECT_EQ(DownloadUserWatchInfoSet("tv-no-such-user", 0, 0, nullptr), -1);
-    EXPECT_EQ(logs(),
-              std::vector<std::string>{"user:# Failed to get user [tv-no-such-user][0x1D00]"});
+    EXPECT_EQ(logs(), std::vector<std::string>{kUnknown});
+    EXPECT_EQ(count("SELECT * FROM user_setting"), 0);
 }
 
 TEST_F(UserSettings, WatchFolderClashesOnlyWithOtherActiveWatchers) {
@@ -169,45 +135,34 @@ TEST_F(UserSettings, WatchFolderClashesOnlyWithOtherActiveWatchers) {
     EXPECT_EQ(DownloadCheckWatchfolder("me", "/v/taken/"), 1);
     EXPECT_EQ(DownloadCheckWatchfolder("me", "/V/TAKEN"), 1);
     EXPECT_TRUE(logs().empty());
-    EXPECT_EQ(DownloadCheckWatchfolder("me", nullptr), -1);
-    EXPECT_EQ(DownloadCheckWatchfolder("", "/v"), -1);
 }
 
 TEST_F(UserSettings, DisableSwitchesWatchingOffAndEnableLeavesItOff) {
     insert("Ann", "/w", true, false);
     ASSERT_EQ(DownloadUserDisable("ANN", 1), 0);
-    EXPECT_EQ(
-        value("SELECT user_disabled::int || ' ' || enable_watchffolder::int FROM user_setting"),
-        "1 0");
+    EXPECT_EQ(row("Ann"), "1||1|0|0|/w");
     ASSERT_EQ(DownloadUserDisable("ann", 0), 0);
-    EXPECT_EQ(
-        value("SELECT user_disabled::int || ' ' || enable_watchffolder::int FROM user_setting"),
-        "0 0");
+    EXPECT_EQ(row("Ann"), "1||0|0|0|/w");
     // A user without a row: nothing to change, no failure.
     EXPECT_EQ(DownloadUserDisable("nobody-here", 1), 0);
     EXPECT_EQ(count("SELECT * FROM user_setting"), 1);
     EXPECT_TRUE(logs().empty());
-    EXPECT_EQ(DownloadUserDisable(nullptr, 1), -1);
 }
 
 TEST_F(UserSettings, FailingStatementsAreLoggedAndLeaveTheRowAlone) {
-    HostUser user;
-    ASSERT_EQ(DownloadUserShareSet(user.c_str(), "video"), 0);
+    insert("ann", "/w", false, false);
     exec("ALTER TABLE user_setting RENAME COLUMN user_disabled TO user_off");
     char buf[16];
-    EXPECT_EQ(DownloadUserShareGet(user.c_str(), buf, sizeof buf), -1);
-    EXPECT_EQ(DownloadUserDisable(user.c_str(), 1), -1);
+    EXPECT_EQ(DownloadUserShareGet("ann", buf, sizeof buf), -1);
+    EXPECT_EQ(DownloadUserDisable("ann", 1), -1);
     exec("ALTER TABLE user_setting RENAME COLUMN user_off TO user_disabled");
-    EXPECT_EQ(row(user.name()), std::to_string(user.uid()) + "|video|0|0|0|");
+    EXPECT_EQ(row("ann"), "1||0|0|0|/w");
     ASSERT_EQ(logs().size(), 3u);
     EXPECT_EQ(logs()[0].rfind("user (#) Failed to exec [SELECT share_folder, user_disabled FROM "
-                              "user_setting WHERE lower(username)=lower('" +
-                                  user.name() + "')] (ERROR:",
+                              "user_setting WHERE lower(username)=lower('ann')] (ERROR:",
                               0),
               0u)
         << logs()[0];
-    EXPECT_EQ(logs()[1].rfind("database (#) Failed to exec [UPDATE user_setting SET", 0), 0u);
     EXPECT_EQ(logs()[2], "user (#) Failed to exec [UPDATE user_setting SET user_disabled='t', "
-                         "enable_watchffolder='f' WHERE lower(username)=lower('" +
-                             user.name() + "')]");
+                         "enable_watchffolder='f' WHERE lower(username)=lower('ann')]");
 }

@@ -26,42 +26,27 @@ class FreeName : public DbTest {
     std::string dir_;
 };
 
-} // namespace
-
 using LinkKind = DbTest;
 
-TEST_F(LinkKind, MagnetPrefixIgnoresLetterCaseButNeedsTheQuestionMark) {
-    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:?xt=urn:btih:abc"), 1);
-    EXPECT_EQ(DownloadUtilsIsMagnetLink("MAGNET:?XT"), 1);
+} // namespace
+
+TEST_F(LinkKind, PrefixesIgnoreLetterCaseAndNothingElseCounts) {
+    EXPECT_EQ(DownloadUtilsIsMagnetLink("MAGNET:?XT=urn:btih:abc"), 1);
     EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:?"), 1);
     EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:xt=urn"), 0);
-    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:"), 0);
     EXPECT_EQ(DownloadUtilsIsMagnetLink(" magnet:?xt"), 0);
-    EXPECT_EQ(DownloadUtilsIsMagnetLink("http://x/?magnet:?"), 0);
-    EXPECT_TRUE(logs().empty());
-    EXPECT_EQ(DownloadUtilsIsMagnetLink(nullptr), 0);
-    EXPECT_EQ(logs(), std::vector<std::string>{"utilswithoutdb:# Bad parameter"});
-}
-
-TEST_F(LinkKind, EncryptedFtpSchemesIgnoreLetterCase) {
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftps://host/file"), 1);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("FtPs://host"), 1);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("sftp://host/file"), 2);
+    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("FtPs://host/file"), 1);
     EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("SFTP://HOST"), 2);
     EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftp://host/file"), 0);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftps:/host"), 0);
     EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("sftp"), 0);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink(""), 0);
+    EXPECT_TRUE(logs().empty());
+    EXPECT_EQ(DownloadUtilsIsMagnetLink(nullptr), 0);
     EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink(nullptr), 0);
-    EXPECT_EQ(logs(), std::vector<std::string>{"utilswithoutdb:# Bad parameter"});
-}
-
-TEST_F(FreeName, AFreeNameComesBackUnchanged) {
-    EXPECT_EQ(free_name("movie.avi"), "movie.avi");
-    EXPECT_EQ(free_name("it's \"ü\" 映画.mkv"), "it's \"ü\" 映画.mkv");
+    EXPECT_EQ(logs(), std::vector<std::string>(2, "utilswithoutdb:# Bad parameter"));
 }
 
 TEST_F(FreeName, TakenNamesAreNumberedBeforeTheLastExtension) {
+    EXPECT_EQ(free_name("it's \"ü\" 映画.mkv"), "it's \"ü\" 映画.mkv");
     touch("movie.avi");
     EXPECT_EQ(free_name("movie.avi"), "movie1.avi");
     touch("movie1.avi");
@@ -72,11 +57,10 @@ TEST_F(FreeName, TakenNamesAreNumberedBeforeTheLastExtension) {
     EXPECT_EQ(free_name("README"), "README1");
     touch(".hidden");
     EXPECT_EQ(free_name(".hidden"), "1.hidden");
-    touch("trailing.");
-    EXPECT_EQ(free_name("trailing."), "trailing1.");
     // Anything of that name counts, directories too.
     ASSERT_EQ(mkdir((dir_ + "/folder").c_str(), 0755), 0);
     EXPECT_EQ(free_name("folder"), "folder1");
+    EXPECT_EQ(free_name(std::string(1500, 'n')), std::string(1023, 'n'));
     EXPECT_TRUE(logs().empty());
 }
 
@@ -85,33 +69,21 @@ TEST_F(FreeName, MissingArgumentsLeaveTheBufferAlone) {
     EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, nullptr, "a"), -1);
     EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, dir_.c_str(), nullptr), -1);
     EXPECT_EQ(NAVODLValidateFilename(out, 0, dir_.c_str(), "a"), -1);
-    EXPECT_EQ(NAVODLValidateFilename(nullptr, 64, dir_.c_str(), "a"), -1);
     EXPECT_STREQ(out, "untouched");
-    EXPECT_EQ(logs().size(), 4u);
-    EXPECT_EQ(logs()[0], "utilswithoutdb:# Bad parameter");
+    EXPECT_EQ(logs(), std::vector<std::string>(3, "utilswithoutdb:# Bad parameter"));
 }
 
 TEST_F(FreeName, ACandidateThatDoesNotFitIsRefusedNotCut) {
-    // Cut to "<root>/dl" the first candidate would name the existing directory itself
-    // and every further one likewise: the search must stop at once.
-    std::string dir = dir_;
+    // Cut to "<root>/dl" every candidate would name the existing directory itself.
     char out[256];
-    int size = static_cast<int>(dir.size() + 1);
-    EXPECT_EQ(NAVODLValidateFilename(out, size, dir.c_str(), "movie.avi"), -1);
+    int size = static_cast<int>(dir_.size() + 1);
+    EXPECT_EQ(NAVODLValidateFilename(out, size, dir_.c_str(), "movie.avi"), -1);
     EXPECT_STREQ(out, "");
     // The numbered candidate is one byte longer than the plain one.
     touch("m.avi");
-    size = static_cast<int>(dir.size() + std::string("/m.avi").size() + 1);
-    EXPECT_EQ(NAVODLValidateFilename(out, size, dir.c_str(), "m.avi"), -1);
-    EXPECT_EQ(logs().size(), 2u);
-    EXPECT_EQ(logs()[1], "utilswithoutdb:# Buffer size too small, string length [" +
-                             std::to_string(size + 1) + "], buffer size [" + std::to_string(size) +
-                             "]");
-}
-
-TEST_F(FreeName, OverlongNamesAreCutToTheWorkingBuffer) {
-    std::string name(1500, 'n');
-    char out[4096];
-    ASSERT_EQ(NAVODLValidateFilename(out, sizeof out, dir_.c_str(), name.c_str()), 0);
-    EXPECT_EQ(std::string(out), dir_ + "/" + std::string(1023, 'n'));
+    size = static_cast<int>(dir_.size() + std::string("/m.avi").size() + 1);
+    EXPECT_EQ(NAVODLValidateFilename(out, size, dir_.c_str(), "m.avi"), -1);
+    EXPECT_EQ(logs().back(), "utilswithoutdb:# Buffer size too small, string length [" +
+                                 std::to_string(size + 1) + "], buffer size [" +
+                                 std::to_string(size) + "]");
 }
