@@ -260,6 +260,13 @@ void count(const CountArgs &args) {
     cli::print_record({{"count", n}});
 }
 
+void rate(const std::string &user) {
+    int download = 0, upload = 0;
+    if (DownloadTotalRateGet(user.c_str(), &download, &upload) == -1)
+        cli::fail("no rates for " + user + ": not a host user, or no database (see syslog)");
+    cli::print_record({{"download_rate", download}, {"upload_rate", upload}});
+}
+
 void setup() {
     CLI::App &task = cli::family("task", "Download tasks");
 
@@ -299,6 +306,13 @@ void setup() {
         ->excludes(user);
     downloading->excludes(user);
     cnt->callback([cargs] { count(*cargs); });
+
+    auto name = std::make_shared<std::string>();
+    CLI::App *rt = task.add_subcommand(
+        "rate", "Summed rates of downloading and seeding tasks: all users' for an "
+                "administrator, else the user's own");
+    rt->add_option("user", *name, "Host user name")->required();
+    rt->callback([name] { rate(*name); });
 }
 
 cli::Registration reg(setup);

@@ -6,8 +6,10 @@
 
 #include "db/access.h"
 #include "platform/log.h"
+#include "platform/navosdk.h"
 #include "torvale/queue.h"
 #include "torvale/task.h"
+#include "torvale/utils.h"
 
 namespace {
 
@@ -19,6 +21,13 @@ constexpr char kCountUser[] =
 constexpr char kLastIdAll[] = "SELECT max(task_id) FROM download_queue";
 constexpr char kLastIdUser[] =
     "SELECT max(task_id) FROM download_queue WHERE lower(username)=lower('%s')";
+
+// Downloading, seeding and seeding (aux): the tasks whose rates make the totals.
+constexpr char kRateAll[] = "SELECT sum(current_rate) as sumdl, sum(upload_rate) as sumul "
+                            "FROM download_queue WHERE status=%d or status=%d or status=%d";
+constexpr char kRateUser[] =
+    "SELECT sum(current_rate) as sumdl, sum(upload_rate) as sumul FROM download_queue "
+    "WHERE (status=%d or status=%d or status=%d) and lower(username)=lower('%s')";
 
 struct HandleClose {
     void operator()(DownloadQueueHandle *h) const noexcept { DownloadQueueClose(h); }
@@ -86,6 +95,35 @@ int user_total(const char *username, const char *all, const char *per_user,
     return -1;
 }
 
+int total_rate(const char *username, int &download_rate, int &upload_rate) noexcept try {
+    DBConn_tag *conn = DownloadDBConnect();
+    if (conn == nullptr) {
+        TV_LOG("%s (%d) Failed to connect to database");
+        return -1;
+    }
+    int admin = NAVOGroupIsAdminGroupMem(username);
+    if (admin == -1) {
+        TV_LOG("%s:%d Failed to check admin group, user [%s]. [0x%04X]", username, NLIBCErrGet());
+        return -1;
+    }
+    std::string sql = admin == 1 ? torvale::db::format(kRateAll, TASK_STATUS_DOWNLOADING,
+                                                       TASK_STATUS_SEEDING, TASK_STATUS_SEED_AUX)
+                                 : torvale::db::format(kRateUser, TASK_STATUS_DOWNLOADING,
+                                                       TASK_STATUS_SEEDING, TASK_STATUS_SEED_AUX,
+                                                       torvale::db::escape(username).c_str());
+    unsigned row = 0;
+    torvale::db::Result result = total_row(conn, sql, true, row);
+    if (result == nullptr)
+        return -1;
+    download_rate = static_cast<int>(torvale::db::field_int(result.get(), row, "sumdl"));
+    upload_rate = static_cast<int>(torvale::db::field_int(result.get(), row, "sumul"));
+    DownloadDBClose(conn);
+    return 0;
+} catch (const std::bad_alloc &) {
+    TV_LOG("%s (%d) Failed to malloc");
+    return -1;
+}
+
 } // namespace
 
 extern "C" {
@@ -117,6 +155,15 @@ TORVALE_API int DownloadTaskCount(const char *username) noexcept {
 
 TORVALE_API int DownloadLastTaskIDGet(const char *username) noexcept {
     return user_total(username, kLastIdAll, kLastIdUser, "max");
+}
+
+TORVALE_API int DownloadTotalRateGet(const char *username, int *download_rate,
+                                     int *upload_rate) noexcept {
+    if (username == nullptr || download_rate == nullptr || upload_rate == nullptr) {
+        TV_LOG("%s (%d) Bad parameter.");
+        return -1;
+    }
+    return total_rate(username, *download_rate, *upload_rate);
 }
 
 } // extern "C"

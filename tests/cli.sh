@@ -121,5 +121,38 @@ check "free-name numbers before the extension" "path  $freedir/a.tar1.gz" "$("$t
 check "free-name of a free name" "path  $freedir/b" "$("$tv" util free-name "$freedir" b)"
 rm -rf "$freedir"
 
+# task list / show / count / rate: 450 tasks, more than one page of the listing.
+psql -q -U admin -d download -v ON_ERROR_STOP=1 >/dev/null <<'SQL'
+TRUNCATE download_queue RESTART IDENTITY;
+INSERT INTO download_queue(username, pid, url, filename, status, total_size, current_size,
+                           current_rate, destination, extra_info)
+SELECT 'u' || (i % 7), -1, 'http://h/' || i, 'f' || i, (ARRAY[1, 2, 3, 8])[1 + i % 4],
+       CASE WHEN i % 5 = 0 THEN 0 ELSE 1000 * i END, 10 * i, (i % 3) * 400, 'd' || i, 'x' || i
+FROM generate_series(1, 450) AS i;
+SQL
+ids() { "$tv" task list --json "$@" | grep -o '"id":[0-9]*' | cut -d: -f2 | tr '\n' ' '; }
+distinct() { "$tv" task list --json "$@" | grep -o '"id":[0-9]*' | sort -u | wc -l; }
+check "task list pages through every task" 450 "$(distinct)"
+check "task list by user name, descending" 450 "$(distinct --sort username --desc)"
+check "task list by progress" 450 "$(distinct --by-progress)"
+check "task list by time left" 450 "$(distinct --by-time-left --desc)"
+check "task list of one user" 64 "$(distinct --user U3)"
+check "task list with a condition" 225 "$(distinct --where 'status=1 or status=3')"
+check "task list limit and offset" "3 4 5 " "$(ids --limit 3 --offset 2)"
+check "task list by time left puts estimates first" "17 " "$(ids --by-time-left --limit 1)"
+check "task list table" "1       u1            downloading  1000 B     1.0%   400 B/s      -         f1" \
+  "$("$tv" task list --limit 1 | tail -1)"
+check "task show" "extra_info         x7" "$("$tv" task show 7 | grep extra_info)"
+check "task show --json status" '"status_name":"paused",' "$("$tv" task show 2 --json | tr -d ' \n' | grep -o '"status_name":"[a-z]*",')"
+check "task show of a missing task fails" 1 "$(status "$tv" task show 451)"
+check "task count" '{"count":450}' "$("$tv" task count --json | tr -d ' \n')"
+check "task count of one user" "count  64" "$("$tv" task count --user u3)"
+check "task list with a hostile sort column fails" 1 "$(status "$tv" task list --sort 'task_id;')"
+check "task list with a bad condition fails" 1 "$(status "$tv" task list --where 'status=1;')"
+check "task list --by-progress --sort is usage" 2 "$(status "$tv" task list --by-progress --sort pid)"
+check "task list --limit -1 is usage" 2 "$(status "$tv" task list --limit -1)"
+check "task rate of an unknown user fails" 1 "$(status "$tv" task rate "nouser$$")"
+check "task rate" 0 "$(status "$tv" task rate root)"
+
 [ $fails -eq 0 ] && echo "CLI checks passed"
 exit $fails

@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -37,6 +38,21 @@ std::vector<std::string> computed(DownloadQueueHandle *raw, const char *column) 
     return out;
 }
 
+// Every field of the record in declaration order.
+std::string dump(const DownloadTaskInfo &t) {
+    auto str = [](const char *s) { return s != nullptr ? s : "(null)"; };
+    std::ostringstream os;
+    os << t.task_id << ' ' << str(t.username) << ' ' << t.pid << ' ' << str(t.url) << ' '
+       << str(t.filename) << ' ' << t.status << ' ' << t.created_time << ' ' << t.started_time
+       << ' ' << t.total_size << ' ' << t.current_size << ' ' << t.current_rate << ' '
+       << t.total_peers << ' ' << t.connected_peers << ' ' << t.total_pieces << ' '
+       << t.downloaded_pieces << ' ' << t.available_pieces << ' ' << t.upload_rate << ' '
+       << t.total_upload << ' ' << t.seeding_ratio << ' ' << t.seeding_interval << ' '
+       << t.seeding_elapsed << ' ' << t.seeders << ' ' << t.leechers << ' ' << t.task_flags << ' '
+       << t.has_torrent;
+    return os.str();
+}
+
 using V = std::vector<int>;
 using S = std::vector<std::string>;
 
@@ -67,63 +83,23 @@ TEST_F(Queue, RecordTakesEveryColumnByNameAndNullsReadAsZero) {
     EXPECT_EQ(handle->rows, 3);
     DownloadTaskInfo *t = DownloadQueueGet(handle.get());
     ASSERT_NE(t, nullptr);
-    EXPECT_EQ(t->task_id, 7);
-    EXPECT_STREQ(t->username, "alice");
-    EXPECT_EQ(t->pid, 4242);
-    EXPECT_STREQ(t->url, "http://h/a.iso");
-    EXPECT_STREQ(t->filename, "a.iso");
-    EXPECT_EQ(t->status, 2);
     // A time stored as -1 reads as the unsigned 32-bit value it always was.
-    EXPECT_EQ(t->created_time, 4294967295u);
-    EXPECT_EQ(t->started_time, 1700000000u);
-    EXPECT_EQ(t->total_size, 1099511627776LL);
-    EXPECT_EQ(t->current_size, 549755813888LL);
-    EXPECT_EQ(t->current_rate, 600);
-    EXPECT_EQ(t->total_peers, 11);
-    EXPECT_EQ(t->connected_peers, 5);
-    EXPECT_EQ(t->total_pieces, 300);
-    EXPECT_EQ(t->downloaded_pieces, 150);
-    EXPECT_EQ(t->available_pieces, 290);
-    EXPECT_EQ(t->upload_rate, 70);
-    EXPECT_EQ(t->total_upload, 8589934592LL);
-    EXPECT_EQ(t->seeding_ratio, 150);
-    EXPECT_EQ(t->seeding_interval, 3600);
-    EXPECT_EQ(t->seeding_elapsed, 120);
-    EXPECT_EQ(t->seeders, 9);
-    EXPECT_EQ(t->leechers, 4);
-    EXPECT_EQ(t->task_flags, 6);
-    EXPECT_EQ(t->has_torrent, 1);
-
-    DownloadTaskInfo *n = DownloadQueueGet(handle.get());
-    ASSERT_EQ(n, t); // one record, overwritten
-    EXPECT_EQ(n->task_id, 8);
-    EXPECT_EQ(n->username, nullptr);
-    EXPECT_EQ(n->url, nullptr);
-    EXPECT_EQ(n->pid, 0);
-    EXPECT_EQ(n->created_time, 0u);
-    EXPECT_EQ(n->total_size, 0);
-    EXPECT_EQ(n->has_torrent, 0);
-
-    ASSERT_NE(DownloadQueueGet(handle.get()), nullptr);
-    EXPECT_EQ(t->task_id, 9);
+    EXPECT_EQ(dump(*t), "7 alice 4242 http://h/a.iso a.iso 2 4294967295 1700000000 "
+                        "1099511627776 549755813888 600 11 5 300 150 290 70 8589934592 150 3600 "
+                        "120 9 4 6 1");
+    ASSERT_EQ(DownloadQueueGet(handle.get()), t); // one record, overwritten
+    EXPECT_EQ(dump(*t), "8 (null) 0 (null) (null) 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0");
+    ASSERT_EQ(DownloadQueueGet(handle.get()), t);
     EXPECT_EQ(t->has_torrent, 0); // stored but empty
 
-    // After the last row: null, no message, and the record cleared.
+    // After the last row, and for a null handle: null, and the record cleared.
     EXPECT_EQ(DownloadQueueGet(handle.get()), nullptr);
-    EXPECT_EQ(t->task_id, 0);
-    EXPECT_EQ(t->seeders, 0);
-    EXPECT_EQ(DownloadQueueGet(handle.get()), nullptr);
+    EXPECT_EQ(dump(*t), "0 (null) 0 (null) (null) 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0");
     EXPECT_TRUE(logs().empty());
-}
-
-TEST_F(Queue, NullHandleIsRefusedAndClearsTheRecord) {
-    task(1, "a", 1, 0, 0, 0);
-    Handle handle(DownloadQueueOpen(nullptr));
-    DownloadTaskInfo *t = DownloadQueueGet(handle.get());
-    ASSERT_NE(t, nullptr);
+    Handle again(DownloadQueueOpen("task_id=7"));
+    ASSERT_NE(DownloadQueueGet(again.get()), nullptr);
     EXPECT_EQ(DownloadQueueGet(nullptr), nullptr);
-    EXPECT_EQ(t->task_id, 0);
-    EXPECT_EQ(t->url, nullptr);
+    EXPECT_EQ(dump(*t), "0 (null) 0 (null) (null) 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0 0");
     DownloadQueueClose(nullptr);
     EXPECT_EQ(logs(), S{"queue (#) Bad parameter."});
 }

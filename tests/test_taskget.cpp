@@ -1,9 +1,11 @@
+#include <cctype>
 #include <cstring>
 #include <string>
 #include <vector>
 
 #include "record/taskset_read.h"
 #include "tests/fixture.h"
+#include "tests/test_platform_support.h"
 #include "torvale/task.h"
 
 namespace {
@@ -132,29 +134,36 @@ TEST_F(TaskRead, ExtraInfoGivesItsLengthThenTheText) {
                          "taskset (#) There is no such task id 5 in the database...why~~~"}));
 }
 
-TEST_F(TaskRead, FailingStatementsAreLoggedWithTheServersText) {
+TEST_F(TaskRead, FailingStatementsAreLoggedInTheFormOfTheirUnit) {
     exec("ALTER TABLE download_queue RENAME COLUMN task_flags TO flags_gone");
     exec("ALTER TABLE download_queue RENAME COLUMN destination TO destination_gone");
+    exec("ALTER TABLE download_queue RENAME COLUMN username TO owner");
     char buf[16];
     EXPECT_EQ(DownloadTaskFlagsGet(1), -1);
     EXPECT_EQ(DownloadTaskDestinationGet(1, buf, sizeof buf), -1);
     EXPECT_EQ(DownloadTaskStatusGet(1), -1);
+    EXPECT_EQ(DownloadTaskCount("x"), -1);
+    exec("ALTER TABLE download_queue RENAME TO download_queue_gone");
+    EXPECT_EQ(DownloadLastTaskIDGet(nullptr), -1);
+    exec("ALTER TABLE download_queue_gone RENAME TO download_queue");
     exec("ALTER TABLE download_queue RENAME COLUMN flags_gone TO task_flags");
     exec("ALTER TABLE download_queue RENAME COLUMN destination_gone TO destination");
-    ASSERT_EQ(logs().size(), 5u);
-    EXPECT_EQ(logs()[0].rfind("taskset (#) Failed to exec [SELECT task_flags FROM download_queue "
-                              "where task_id=1] (ERROR:",
-                              0),
-              0u)
-        << logs()[0];
-    EXPECT_EQ(logs()[1].rfind("taskset:# Failed to exec [SELECT destination FROM download_queue "
-                              "where task_id=1] (ERROR:",
-                              0),
-              0u)
-        << logs()[1];
-    EXPECT_EQ(logs()[2], "taskset:# Failed to get [destination] value of task [1]");
-    EXPECT_EQ(logs()[3].rfind("queue (#) Failed to exec [SELECT task_id,", 0), 0u) << logs()[3];
-    EXPECT_EQ(logs()[4], "taskget (#) Failed to open queue handler.");
+    exec("ALTER TABLE download_queue RENAME COLUMN owner TO username");
+    const S starts{
+        "taskset (#) Failed to exec [SELECT task_flags FROM download_queue where task_id=1] "
+        "(ERROR:",
+        "taskset:# Failed to exec [SELECT destination FROM download_queue where task_id=1] "
+        "(ERROR:",
+        "taskset:# Failed to get [destination] value of task [1]",
+        "queue (#) Failed to exec [SELECT task_id,",
+        "taskget (#) Failed to open queue handler.",
+        "taskget (#) Failed to exec [SELECT count(*) FROM download_queue WHERE "
+        "lower(username)=lower('x')] (ERROR:",
+        "taskget (#) Failed to query database. (ERROR:  relation \"download_queue\" does not "
+        "exist"};
+    ASSERT_EQ(logs().size(), starts.size());
+    for (size_t i = 0; i < starts.size(); ++i)
+        EXPECT_EQ(logs()[i].rfind(starts[i], 0), 0u) << logs()[i];
 }
 
 using TaskTotals = DbTest;
@@ -179,24 +188,72 @@ TEST_F(TaskTotals, CountAndLastIdOverAllOrOneUser) {
     EXPECT_EQ(value("SELECT count(*) FROM download_queue"), "4");
 }
 
-TEST_F(TaskTotals, FailingStatementsAreLoggedPerForm) {
-    exec("ALTER TABLE download_queue RENAME COLUMN username TO owner");
-    EXPECT_EQ(DownloadTaskCount("x"), -1);
-    EXPECT_EQ(DownloadLastTaskIDGet("x"), -1);
-    exec("ALTER TABLE download_queue RENAME COLUMN owner TO username");
-    exec("ALTER TABLE download_queue RENAME TO download_queue_gone");
-    EXPECT_EQ(DownloadTaskCount(nullptr), -1);
-    exec("ALTER TABLE download_queue_gone RENAME TO download_queue");
-    ASSERT_EQ(logs().size(), 3u);
-    EXPECT_EQ(logs()[0].rfind("taskget (#) Failed to exec [SELECT count(*) FROM download_queue "
-                              "WHERE lower(username)=lower('x')] (ERROR:",
-                              0),
-              0u)
-        << logs()[0];
-    EXPECT_EQ(logs()[1].rfind("taskget (#) Failed to exec [SELECT max(task_id)", 0), 0u);
-    EXPECT_EQ(logs()[2].rfind("taskget (#) Failed to query database. (ERROR:  relation "
-                              "\"download_queue\" does not exist",
-                              0),
-              0u)
-        << logs()[2];
+class TaskRate : public DbTest {
+  protected:
+    HostGroup admins_{"administrators"};
+    HostUser admin_;
+    HostUser plain_;
+
+    void SetUp() override {
+        DbTest::SetUp();
+        admins_.add(admin_);
+        // Rates in powers of two, so each sum says which statuses it took.
+        std::string values;
+        int bit = 0;
+        for (const std::string &user : {plain_.name(), upper(plain_.name()), admin_.name()})
+            for (int status : {1, 2, 3, 5, 6, 7, 8, 101, 4}) {
+                values += (values.empty() ? "('" : ", ('") + user + "', " + std::to_string(status) +
+                          ", " + std::to_string(1 << bit) + ", " + std::to_string(1 << (bit + 1)) +
+                          ")";
+                bit = (bit + 2) % 28;
+            }
+        exec("INSERT INTO download_queue(username, status, current_rate, upload_rate) VALUES " +
+             values);
+    }
+    static std::string upper(std::string s) {
+        for (char &c : s)
+            c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+        return s;
+    }
+    std::string sums(const std::string &where) {
+        return value("SELECT coalesce(sum(current_rate), 0) || ' ' || coalesce(sum(upload_rate), "
+                     "0) FROM download_queue WHERE status IN (2, 7, 8) " +
+                     where);
+    }
+};
+
+TEST_F(TaskRate, AdministratorsSeeEveryonesActiveTasksOthersTheirOwn) {
+    int dl = -1, ul = -1;
+    ASSERT_EQ(DownloadTotalRateGet(admin_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(std::to_string(dl) + " " + std::to_string(ul), sums(""));
+
+    ASSERT_EQ(DownloadTotalRateGet(plain_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(std::to_string(dl) + " " + std::to_string(ul),
+              sums("AND lower(username)=lower('" + plain_.name() + "')"));
+    EXPECT_NE(sums("AND lower(username)=lower('" + plain_.name() + "')"), sums(""));
+    EXPECT_TRUE(logs().empty());
+
+    // Nothing downloading or seeding: both rates 0, and still success.
+    exec("UPDATE download_queue SET status=6 WHERE status IN (2, 7, 8)");
+    ASSERT_EQ(DownloadTotalRateGet(admin_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(dl, 0);
+    EXPECT_EQ(ul, 0);
+    dl = ul = -1;
+    ASSERT_EQ(DownloadTotalRateGet(plain_.c_str(), &dl, &ul), 0);
+    EXPECT_EQ(dl, 0);
+    EXPECT_EQ(ul, 0);
+}
+
+TEST_F(TaskRate, RefusalsAndUnknownUsersLeaveTheRatesAlone) {
+    int dl = 7, ul = 9;
+    EXPECT_EQ(DownloadTotalRateGet(nullptr, &dl, &ul), -1);
+    EXPECT_EQ(DownloadTotalRateGet(plain_.c_str(), nullptr, &ul), -1);
+    EXPECT_EQ(DownloadTotalRateGet(plain_.c_str(), &dl, nullptr), -1);
+    EXPECT_EQ(DownloadTotalRateGet("no-such-user-anywhere", &dl, &ul), -1);
+    EXPECT_EQ(dl, 7);
+    EXPECT_EQ(ul, 9);
+    EXPECT_EQ(logs(), (S{"taskget (#) Bad parameter.", "taskget (#) Bad parameter.",
+                         "taskget (#) Bad parameter.",
+                         "taskget:# Failed to check admin group, user [no-such-user-anywhere]. "
+                         "[0x1D00]"}));
 }
