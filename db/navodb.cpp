@@ -9,6 +9,8 @@
 #include <poll.h>
 #include <pthread.h>
 #include <string>
+#include <utility>
+#include <vector>
 
 struct DBConn_tag {
     PGconn *pg = nullptr;
@@ -19,6 +21,11 @@ struct DBResult_tag {
     PGresult *pg = nullptr;
     int rows = 0;
     int next = 0; // the row NAVODBFetchRow hands out next
+    // Column numbers of the names asked for so far, in the order first asked. Readers
+    // ask for the same names in the same order on every row, so `hint` (the entry after
+    // the last one found) nearly always answers at once.
+    mutable std::vector<std::pair<const char *, int>> columns;
+    mutable size_t hint = 0;
 };
 
 namespace {
@@ -219,11 +226,42 @@ int NAVODBFetchRow(DBResult_tag *result, unsigned int *row) noexcept {
     return 0;
 }
 
+namespace {
+
+bool names_column(const DBResult_tag *result, const std::pair<const char *, int> &entry,
+                  const char *column) {
+    // Same pointer and still the same text: a caller may reuse a buffer for other names.
+    return entry.first == column && std::strcmp(PQfname(result->pg, entry.second), column) == 0;
+}
+
+int column_number(const DBResult_tag *result, const char *column) {
+    auto &cols = result->columns;
+    for (size_t i = 0, n = cols.size(); i < n; ++i) {
+        size_t at = (result->hint + i) % n;
+        if (names_column(result, cols[at], column)) {
+            result->hint = at + 1;
+            return cols[at].second;
+        }
+    }
+    int col = PQfnumber(result->pg, column);
+    if (col >= 0 && std::strcmp(PQfname(result->pg, col), column) == 0) {
+        try {
+            cols.emplace_back(column, col);
+            result->hint = cols.size();
+        } catch (const std::bad_alloc &) {
+            // Without the cache the lookup is only slower.
+        }
+    }
+    return col;
+}
+
+} // namespace
+
 const char *NAVODBFetchField(const DBResult_tag *result, unsigned int row,
                              const char *column) noexcept {
     if (result == nullptr || column == nullptr || row >= static_cast<unsigned>(result->rows))
         return nullptr;
-    int col = PQfnumber(result->pg, column);
+    int col = column_number(result, column);
     if (col < 0 || PQgetisnull(result->pg, static_cast<int>(row), col))
         return nullptr;
     return PQgetvalue(result->pg, static_cast<int>(row), col);

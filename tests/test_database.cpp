@@ -2,6 +2,7 @@
 #include <string>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <vector>
 
 #include "db/access.h"
 #include "tests/fixture.h"
@@ -166,6 +167,30 @@ TEST_F(Database, BlobsRoundTripEveryByteValue) {
     EXPECT_EQ(empty_len, 0u);
     EXPECT_EQ(NAVODBBlogDecode("\\x0", &len), nullptr);
     EXPECT_EQ(NAVODBBlogDecode("\\xzz", &len), nullptr);
+}
+
+TEST_F(Database, FieldsAreFoundByNameWhateverOrderAndBufferTheNamesComeIn) {
+    exec("INSERT INTO download_queue(username, pid, status) VALUES ('a', 11, 1), ('b', 22, 2)");
+    torvale::db::Result r;
+    ASSERT_EQ(torvale::db::execute(DownloadDBConnect(),
+                                   "SELECT username, pid, status FROM download_queue ORDER BY "
+                                   "task_id",
+                                   r),
+              0);
+    char name[16];
+    std::vector<std::string> seen;
+    unsigned row = 0;
+    while (NAVODBFetchRow(r.get(), &row) != -1) {
+        // One buffer for every name, asked for in a different order on each row.
+        for (const char *col : row == 0 ? std::vector<const char *>{"status", "username", "pid"}
+                                        : std::vector<const char *>{"pid", "status", "username"}) {
+            std::strcpy(name, col);
+            seen.push_back(std::string(col) + "=" + NAVODBFetchField(r.get(), row, name));
+        }
+    }
+    EXPECT_EQ(seen, (std::vector<std::string>{"status=1", "username=a", "pid=11", "pid=22",
+                                              "status=2", "username=b"}));
+    EXPECT_STREQ(NAVODBFetchField(r.get(), 0, "STATUS"), "1");
 }
 
 TEST_F(Database, SelectLimitPagesAndNullsReadAsNull) {
