@@ -21,6 +21,12 @@ for a in "$@"; do
     *) dir=$a ;;
   esac
 done
+# As root the server runs as "postgres", which must be able to reach the directory. A
+# project under a private home cannot host it: the default then moves to /tmp, under a
+# name derived from the project's path, so start, env and stop agree.
+if [ "$(id -u)" -eq 0 ] && [ "$dir" = "$repo/.pg" ] && ! (cd / && runuser -u postgres -- test -x "$repo"); then
+  dir="/tmp/torvale-pg-$(printf %s "$repo" | cksum | cut -d' ' -f1)"
+fi
 mkdir -p "$dir"
 dir=$(cd "$dir" && pwd)
 port=${TORVALE_PGPORT:-5432}
@@ -29,7 +35,7 @@ data="$dir/data"
 sock="$dir/run"
 
 as_server() {
-  if [ "$(id -u)" -eq 0 ]; then runuser -u postgres -- "$@"; else "$@"; fi
+  if [ "$(id -u)" -eq 0 ]; then (cd / && runuser -u postgres -- "$@"); else "$@"; fi
 }
 
 # The pid file names a live server only if that process is a postgres that has not

@@ -8,6 +8,10 @@ cd "$repo"
 scripts/deps.sh
 
 pgdir="$repo/build-test-pg"
+# The server runs as "postgres" when we are root; it must be able to reach its directory.
+if [ "$(id -u)" -eq 0 ] && ! (cd / && runuser -u postgres -- test -x "$repo"); then
+  pgdir="/tmp/torvale-test-pg-$(printf %s "$repo" | cksum | cut -d' ' -f1)"
+fi
 cleanup() { scripts/pg.sh stop "$pgdir" || true; rm -rf "$pgdir"; }
 cleanup
 trap cleanup EXIT
