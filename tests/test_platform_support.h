@@ -1,9 +1,10 @@
 // What the platform tests share: host accounts made for one test and removed after it
-// (tests run as root), and a scratch directory that is also the relocation root.
+// (tests run as root), a scratch relocation root, and small text helpers.
 #pragma once
 
-#include <cstdlib>
-#include <gtest/gtest.h>
+#include <cctype>
+#include <fstream>
+#include <iterator>
 #include <pwd.h>
 #include <string>
 #include <unistd.h>
@@ -21,7 +22,6 @@ class HostUser {
         EXPECT_EQ(run_shell("useradd -M " + opts + name_ + " >/dev/null 2>&1"), 0) << name_;
     }
     ~HostUser() { run_shell("userdel " + name_ + " >/dev/null 2>&1"); }
-
     const std::string &name() const { return name_; }
     const char *c_str() const { return name_.c_str(); }
     const passwd &entry() const { return *getpwnam(name_.c_str()); }
@@ -34,8 +34,7 @@ class HostUser {
 class HostGroup {
   public:
     explicit HostGroup(const std::string &name) : name_(name) {
-        created_ = run_shell("getent group " + name_ + " >/dev/null") != 0;
-        if (created_) {
+        if ((created_ = run_shell("getent group " + name_ + " >/dev/null") != 0)) {
             EXPECT_EQ(run_shell("groupadd " + name_), 0);
         }
     }
@@ -52,19 +51,23 @@ class HostGroup {
     bool created_ = false;
 };
 
-// A directory made for the test and exported as TORVALE_ROOT, removed after it.
-class ScratchDir : public ::testing::Test {
+// The database fixture's scratch TORVALE_ROOT, for tests of the platform layer.
+class ScratchDir : public DbTest {
   protected:
     void SetUp() override {
-        char tmpl[] = "/tmp/torvale-scratch.XXXXXX";
-        ASSERT_NE(mkdtemp(tmpl), nullptr);
-        dir_ = tmpl;
-        setenv("TORVALE_ROOT", dir_.c_str(), 1);
+        DbTest::SetUp();
+        dir_ = root();
     }
-    void TearDown() override {
-        unsetenv("TORVALE_ROOT");
-        run_shell("rm -rf '" + dir_ + "'");
-    }
-
     std::string dir_;
 };
+
+inline std::string read_all(const std::string &path) {
+    std::ifstream in(path);
+    return std::string(std::istreambuf_iterator<char>(in), {});
+}
+
+inline std::string upper(std::string s) {
+    for (char &c : s)
+        c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    return s;
+}

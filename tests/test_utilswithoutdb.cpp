@@ -14,7 +14,11 @@ class FreeName : public DbTest {
         dir_ = root() + "/dl";
         ASSERT_EQ(mkdir(dir_.c_str(), 0755), 0);
     }
-    void touch(const std::string &name) { std::ofstream(dir_ + "/" + name) << "x"; }
+    // Makes a file of that name, then asks for a free one.
+    std::string taken(const std::string &name) {
+        std::ofstream(dir_ + "/" + name) << "x";
+        return free_name(name);
+    }
     // The free name found for `name`, relative to the directory.
     std::string free_name(const std::string &name) {
         char out[4096] = "untouched";
@@ -33,30 +37,24 @@ using LinkKind = DbTest;
 TEST_F(LinkKind, PrefixesIgnoreLetterCaseAndNothingElseCounts) {
     EXPECT_EQ(DownloadUtilsIsMagnetLink("MAGNET:?XT=urn:btih:abc"), 1);
     EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:?"), 1);
-    EXPECT_EQ(DownloadUtilsIsMagnetLink("magnet:xt=urn"), 0);
-    EXPECT_EQ(DownloadUtilsIsMagnetLink(" magnet:?xt"), 0);
     EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("FtPs://host/file"), 1);
     EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("SFTP://HOST"), 2);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("ftp://host/file"), 0);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink("sftp"), 0);
-    EXPECT_TRUE(logs().empty());
-    EXPECT_EQ(DownloadUtilsIsMagnetLink(nullptr), 0);
-    EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink(nullptr), 0);
+    const char *neither[] = {"magnet:xt=urn", " magnet:?xt", "ftp://host/file", "sftp", nullptr};
+    for (const char *link : neither) {
+        EXPECT_EQ(DownloadUtilsIsMagnetLink(link), 0) << link;
+        EXPECT_EQ(DownloadUtilsIsFTPEncrptionLink(link), 0) << link;
+    }
     EXPECT_EQ(logs(), std::vector<std::string>(2, "utilswithoutdb:# Bad parameter"));
 }
 
 TEST_F(FreeName, TakenNamesAreNumberedBeforeTheLastExtension) {
     EXPECT_EQ(free_name("it's \"ü\" 映画.mkv"), "it's \"ü\" 映画.mkv");
-    touch("movie.avi");
-    EXPECT_EQ(free_name("movie.avi"), "movie1.avi");
-    touch("movie1.avi");
+    EXPECT_EQ(taken("movie.avi"), "movie1.avi");
+    EXPECT_EQ(taken("movie1.avi"), "movie11.avi");
     EXPECT_EQ(free_name("movie.avi"), "movie2.avi");
-    touch("a.tar.gz");
-    EXPECT_EQ(free_name("a.tar.gz"), "a.tar1.gz");
-    touch("README");
-    EXPECT_EQ(free_name("README"), "README1");
-    touch(".hidden");
-    EXPECT_EQ(free_name(".hidden"), "1.hidden");
+    EXPECT_EQ(taken("a.tar.gz"), "a.tar1.gz");
+    EXPECT_EQ(taken("README"), "README1");
+    EXPECT_EQ(taken(".hidden"), "1.hidden");
     // Anything of that name counts, directories too.
     ASSERT_EQ(mkdir((dir_ + "/folder").c_str(), 0755), 0);
     EXPECT_EQ(free_name("folder"), "folder1");
@@ -64,23 +62,19 @@ TEST_F(FreeName, TakenNamesAreNumberedBeforeTheLastExtension) {
     EXPECT_TRUE(logs().empty());
 }
 
-TEST_F(FreeName, MissingArgumentsLeaveTheBufferAlone) {
-    char out[64] = "untouched";
+TEST_F(FreeName, MissingArgumentsLeaveTheBufferAloneAndCandidatesThatDoNotFitAreRefused) {
+    char out[256] = "untouched";
     EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, nullptr, "a"), -1);
     EXPECT_EQ(NAVODLValidateFilename(out, sizeof out, dir_.c_str(), nullptr), -1);
     EXPECT_EQ(NAVODLValidateFilename(out, 0, dir_.c_str(), "a"), -1);
     EXPECT_STREQ(out, "untouched");
     EXPECT_EQ(logs(), std::vector<std::string>(3, "utilswithoutdb:# Bad parameter"));
-}
-
-TEST_F(FreeName, ACandidateThatDoesNotFitIsRefusedNotCut) {
     // Cut to "<root>/dl" every candidate would name the existing directory itself.
-    char out[256];
     int size = static_cast<int>(dir_.size() + 1);
     EXPECT_EQ(NAVODLValidateFilename(out, size, dir_.c_str(), "movie.avi"), -1);
     EXPECT_STREQ(out, "");
     // The numbered candidate is one byte longer than the plain one.
-    touch("m.avi");
+    EXPECT_EQ(taken("m.avi"), "m1.avi");
     size = static_cast<int>(dir_.size() + std::string("/m.avi").size() + 1);
     EXPECT_EQ(NAVODLValidateFilename(out, size, dir_.c_str(), "m.avi"), -1);
     EXPECT_EQ(logs().back(), "utilswithoutdb:# Buffer size too small, string length [" +
