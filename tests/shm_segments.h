@@ -21,45 +21,36 @@
 // whatever the test's outcome.
 class DaemonSegments {
   public:
-    DaemonSegments() {
-        lock_ = open("/tmp/torvale-shm-tests.lock", O_CREAT | O_RDWR | O_CLOEXEC, 0666);
-        if (lock_ != -1)
-            flock(lock_, LOCK_EX);
+    DaemonSegments()
+        : lock_(open("/tmp/torvale-shm-tests.lock", O_CREAT | O_RDWR | O_CLOEXEC, 0666)) {
+        flock(lock_, LOCK_EX);
         remove_all();
     }
     ~DaemonSegments() {
         for (void *addr : attached_)
             shmdt(addr);
         remove_all();
-        if (lock_ != -1)
-            close(lock_); // releases the lock
+        close(lock_); // releases the lock
     }
-
     // Creates the segment as the daemon does (IPC_CREAT, mode 0666) and attaches it here.
     volatile int *create(int key, size_t size) {
-        int id = shmget(key, size, IPC_CREAT | 0666);
-        void *addr = id != -1 ? shmat(id, nullptr, 0) : reinterpret_cast<void *>(-1);
-        EXPECT_NE(addr, reinterpret_cast<void *>(-1)) << "segment " << key << ": " << errno;
-        if (addr == reinterpret_cast<void *>(-1))
+        void *addr = shmat(shmget(key, size, IPC_CREAT | 0666), nullptr, 0);
+        if (addr == reinterpret_cast<void *>(-1)) {
+            ADD_FAILURE() << "segment " << key << ": " << errno;
             return nullptr;
+        }
         attached_.push_back(addr);
         return static_cast<volatile int *>(addr);
     }
     // Removes the segment while this guard stays attached, as a daemon that restarts.
-    static void remove(int key) {
-        int id = shmget(key, 0, 0);
-        if (id != -1)
-            shmctl(id, IPC_RMID, nullptr);
-    }
-    static bool exists(int key) { return shmget(key, 0, 0) != -1; }
+    static void remove(int key) { shmctl(shmget(key, 0, 0), IPC_RMID, nullptr); }
 
   private:
     static void remove_all() {
         remove(DOWNLOAD_SHM_TRIGGER_KEY);
         remove(DOWNLOAD_SHM_PROGRESS_KEY);
     }
-
-    int lock_ = -1;
+    int lock_;
     std::vector<void *> attached_;
 };
 
