@@ -40,6 +40,11 @@ inline int select_limit(DBConn_tag *conn, const char *sql, int limit, int offset
     return rc;
 }
 
+// A required text argument: given and not empty.
+inline bool present(const char *text) noexcept {
+    return text != nullptr && text[0] != '\0';
+}
+
 // A statement formatted whole, however long its texts. Throws std::bad_alloc.
 std::string format(const char *fmt, ...) __attribute__((format(printf, 1, 2)));
 

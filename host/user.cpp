@@ -12,6 +12,8 @@
 
 namespace {
 
+using torvale::db::present;
+
 constexpr char kLogUnit[] = "user";
 
 constexpr char kSelectRow[] =
@@ -42,10 +44,6 @@ constexpr char kEnable[] =
     "UPDATE user_setting SET user_disabled='f' WHERE lower(username)=lower('%s')";
 
 constexpr size_t kFolderBytes = 4096;
-
-bool present(const char *text) {
-    return text != nullptr && *text != '\0';
-}
 
 bool is_true(const char *value) {
     return value != nullptr && value[0] == 't';

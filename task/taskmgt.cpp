@@ -21,6 +21,8 @@
 
 namespace {
 
+using torvale::db::present;
+
 constexpr char kLogUnit[] = "taskmgt";
 
 constexpr char kLinkInsert[] =
@@ -56,10 +58,6 @@ int DownloadTaskEscape(const char *text, std::string *out) noexcept {
         return -1;
     }
     return 0;
-}
-
-bool present(const char *text) {
-    return text != nullptr && text[0] != '\0';
 }
 
 // The text after the last '/' when something follows it, else the whole text.
